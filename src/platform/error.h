@@ -1,0 +1,12 @@
+// The platform's last error.
+#ifndef PLATFORM_ERROR_H_
+#define PLATFORM_ERROR_H_
+
+extern "C" {
+
+// Returns the code that the calling thread's last failed platform operation left; log lines print it
+// as "ret = %d". It says nothing after an operation that succeeded.
+int ALIBCErrGet();
+}
+
+#endif  // PLATFORM_ERROR_H_

@@ -1,0 +1,33 @@
+// The platform's list of strings. Strings are NUL-terminated and are copied in.
+#ifndef PLATFORM_LIST_H_
+#define PLATFORM_LIST_H_
+
+struct ALIBSZLIST;
+
+extern "C" {
+
+// Makes an empty list with room for `size` strings; it grows when that is not enough.
+// Returns null when memory ran out. ALIBCSzListFree() takes it back.
+ALIBSZLIST* ALIBCSzListAlloc(int size);
+
+// Frees a list and everything in it; null is allowed.
+void ALIBCSzListFree(ALIBSZLIST* list);
+
+// Takes every string out and leaves the list usable.
+void ALIBCSzListRemoveAll(ALIBSZLIST* list);
+
+// Appends a string. Growing may move the list, hence the pointer's address.
+// Returns the new number of strings, negative on failure.
+int ALIBCSzListPush(ALIBSZLIST** list, const char* text);
+
+// Returns the index of the first string equal to `text`, or a negative value when there is none.
+int ALIBCSzListFind(const ALIBSZLIST* list, const char* text);
+
+// Returns the number of strings.
+int ALIBCSzListSize(const ALIBSZLIST* list);
+
+// Returns the string at an index, which the list keeps, or null when the index is out of range.
+const char* ALIBCSzListGet(const ALIBSZLIST* list, int index);
+}
+
+#endif  // PLATFORM_LIST_H_
