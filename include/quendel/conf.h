@@ -23,8 +23,8 @@ QUENDEL_EXPORT int QUENDELGetConf(QUENDELConf_t* conf);
 // The host name of the service's server, without scheme, port or path: key "quendel_server" of
 // "/etc.defaults/arvoinfo.conf", of which the first 31 bytes count.
 //
-// The file is read at the first call only. What that read gave stays for the life of the process; if
-// it gave nothing, that is the host built into the library. Safe to call from several threads.
+// The file is read at the first call only. What that read gave stays for the life of the process;
+// if it gave nothing, that is the host built into the library. Safe to call from several threads.
 //
 // Returns the host name; never fails.
 QUENDEL_EXPORT std::string QUENDELGetServerHost();
@@ -50,9 +50,9 @@ QUENDEL_EXPORT int QUENDELGetHMXModel(char* buf, size_t size);
 
 // Writes the version of the operating system into buf, for a reader: "HMX 3.1-1021", or
 // "HMX 3.1-1021 Update 7" when an update is installed. The parts are the keys "majorversion",
-// "minorversion", "buildnumber" and "smallfixnumber" of "/etc.defaults/VERSION". An update counts as
-// installed when "smallfixnumber" is there and is anything but exactly "0". A missing key or file
-// leaves its places empty. The text is cut to size - 1 bytes and always NUL-terminated.
+// "minorversion", "buildnumber" and "smallfixnumber" of "/etc.defaults/VERSION". An update counts
+// as installed when "smallfixnumber" is there and is anything but exactly "0". A missing key or
+// file leaves its places empty. The text is cut to size - 1 bytes and always NUL-terminated.
 //
 // Returns 0, or -1 with buf untouched when memory ran out.
 QUENDEL_EXPORT int QUENDELGetHMXVersion(char* buf, size_t size);
@@ -65,13 +65,14 @@ QUENDEL_EXPORT int QUENDELGetHMXVersion(char* buf, size_t size);
 // the text was cut; or -1, with an empty text, for a moment that has no calendar date.
 QUENDEL_EXPORT int QUENDELGetLocalTime(char* buf, size_t size, time_t when);
 
-// Finds a work directory name that no directory has yet, "/tmp/quendel_20240305_070809_0": the local
-// time of `when` and the first number, counted from 0, that is free. A file of that name does not
-// make it taken. The directory is not created, so two processes can find the same name; not safe to
-// call from several threads at once. The text is cut to size - 1 bytes and always NUL-terminated; 64
-// bytes are enough.
+// Finds a work directory name that no directory has yet, "/tmp/quendel_20240305_070809_0": the
+// local time of `when` and the first number, counted from 0, that is free. A file of that name does
+// not make it taken. The directory is not created, so two processes can find the same name; not
+// safe to call from several threads at once. The text is cut to size - 1 bytes and always
+// NUL-terminated; 64 bytes are enough.
 //
-// Returns the platform's answer for the name found: 0, or negative when the platform could not tell.
+// Returns the platform's answer for the name found: 0, or negative when the platform could not
+// tell.
 QUENDEL_EXPORT int QUENDELGetDstDir(char* buf, size_t size, time_t when);
 
 #endif  // QUENDEL_CONF_H_

@@ -22,8 +22,8 @@ extern QUENDEL_EXPORT const char* const QUENDEL_ACTION_NAMES[6];
 // Returns 0 when the server accepted the heartbeat, else -1.
 QUENDEL_EXPORT int QUENDELHeartbeat(Json::Value& actions);
 
-// Tells the server how an action that it requested stands. `requestId` is the number the server gave
-// the request; `details` is sent as it is and may be an empty object.
+// Tells the server how an action that it requested stands. `requestId` is the number the server
+// gave the request; `details` is sent as it is and may be an empty object.
 //
 // Needs a signed-in cloud account.
 //

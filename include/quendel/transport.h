@@ -13,10 +13,11 @@
 
 // Error numbers of the appliance's web API that tell its user interface what the server answered.
 enum _tag_WEBAPI_CORE_ERR : int {
-  WEBAPI_CORE_ERR_QUENDEL_DENIED = 403,          // server code 111000
-  WEBAPI_CORE_ERR_QUENDEL_UNKNOWN = 6900,        // any code that the table does not hold
-  WEBAPI_CORE_ERR_QUENDEL_REJECTED = 6905,       // server code 111001
-  WEBAPI_CORE_ERR_QUENDEL_SERVER_FAILURE = 6999  // server code 119999, and replies without an answer
+  WEBAPI_CORE_ERR_QUENDEL_DENIED = 403,     // server code 111000
+  WEBAPI_CORE_ERR_QUENDEL_UNKNOWN = 6900,   // any code that the table does not hold
+  WEBAPI_CORE_ERR_QUENDEL_REJECTED = 6905,  // server code 111001
+  WEBAPI_CORE_ERR_QUENDEL_SERVER_FAILURE =
+      6999  // server code 119999, and replies without an answer
 };
 
 // The web-API error of each server code that has one of its own. Filled when the library is loaded
@@ -34,8 +35,8 @@ QUENDEL_EXPORT std::string QUENDELGenerateReq(const std::vector<std::string>& pi
 //
 // The certificate and the host name of the server are not verified. Replies are held in memory
 // whole, whatever their size. `response` receives the reply whenever that was JSON, also when the
-// status was not 200; otherwise it is untouched. Whether the reply reports success is for the caller
-// to judge.
+// status was not 200; otherwise it is untouched. Whether the reply reports success is for the
+// caller to judge.
 //
 // The first transfer of a process initialises libcurl, which must not race with another thread's
 // first transfer; later calls may run in parallel.

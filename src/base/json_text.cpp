@@ -44,7 +44,7 @@ int JsonInt(const Json::Value& object, const char* key) {
 std::string JsonText(const Json::Value& object, const char* key) {
   const Json::Value* member = JsonMember(object, key);
   return member != nullptr && member->isConvertibleTo(Json::stringValue) ? member->asString()
-                                                                        : std::string();
+                                                                         : std::string();
 }
 
 }  // namespace quendel

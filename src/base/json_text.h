@@ -18,8 +18,8 @@ bool JsonFromText(const std::string& text, Json::Value& value);
 // Returns the value's JSON text: compact, without a line end.
 std::string JsonToText(const Json::Value& value);
 
-// Each of these reads one member of an object. A value that is no object, a missing member and one of
-// a kind that JsonCpp does not convert read as false, 0 or an empty text.
+// Each of these reads one member of an object. A value that is no object, a missing member and one
+// of a kind that JsonCpp does not convert read as false, 0 or an empty text.
 bool JsonBool(const Json::Value& object, const char* key);
 int JsonInt(const Json::Value& object, const char* key);
 std::string JsonText(const Json::Value& object, const char* key);

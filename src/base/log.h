@@ -8,7 +8,6 @@
 
 #include <syslog.h>
 
-#define QUENDEL_LOG(format, ...) \
-  syslog(LOG_ERR, "%s:%d " format, kLogUnit, __LINE__, ##__VA_ARGS__)
+#define QUENDEL_LOG(format, ...) syslog(LOG_ERR, "%s:%d " format, kLogUnit, __LINE__, ##__VA_ARGS__)
 
 #endif  // BASE_LOG_H_

@@ -4,8 +4,8 @@
 
 extern "C" {
 
-// Returns the code that the calling thread's last failed platform operation left; log lines print it
-// as "ret = %d". It says nothing after an operation that succeeded.
+// Returns the code that the calling thread's last failed platform operation left; log lines print
+// it as "ret = %d". It says nothing after an operation that succeeded.
 int ALIBCErrGet();
 }
 

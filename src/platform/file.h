@@ -11,8 +11,8 @@ int ALIBCFileExist(const char* path);
 // exist; negative when that cannot be told.
 int ALIBCFileCheckDir(const char* path);
 
-// Releases a file lock of the whole platform that this process may hold, named by its number. A lock
-// that is not held is no failure. Returns 0, or negative on failure.
+// Releases a file lock of the whole platform that this process may hold, named by its number. A
+// lock that is not held is no failure. Returns 0, or negative on failure.
 int ALIBCFileUnlock(int lockId);
 }
 

@@ -1,7 +1,7 @@
 // The platform's string-to-string hash. Keys and values are NUL-terminated and are copied in.
 //
-// Operations that can replace the hash take the address of the caller's pointer, because growing may
-// move it.
+// Operations that can replace the hash take the address of the caller's pointer, because growing
+// may move it.
 #ifndef PLATFORM_HASH_H_
 #define PLATFORM_HASH_H_
 
@@ -27,9 +27,9 @@ int ALIBCSzHashSetValue(ALIBSZHASH** hash, const char* key, const char* value);
 void ALIBCHashRemoveAll(ALIBSZHASH* hash);
 
 // Appends every key to a list. A commit writes the keys in this order, so it is part of the
-// contract: descending by byte value, which puts "total_byte", "tar_log_inode" and "last_hash" before
-// "last_byte" and "inode". A commit that is cut short after any of them makes the next collection
-// repeat lines and never lose any. Returns the number of keys, negative on failure.
+// contract: descending by byte value, which puts "total_byte", "tar_log_inode" and "last_hash"
+// before "last_byte" and "inode". A commit that is cut short after any of them makes the next
+// collection repeat lines and never lose any. Returns the number of keys, negative on failure.
 int ALIBCSzHashEnumKey(ALIBSZHASH* hash, ALIBSZLIST** keys);
 }
 

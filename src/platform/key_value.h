@@ -14,8 +14,8 @@ extern "C" {
 // value is empty; negative when the file cannot be read. buf is untouched unless the key was found.
 int ALIBCFileGetKeyValue(const char* path, const char* key, char* buf, int size, int flags);
 
-// Sets the value of one key, adding the key when the file lacks it and keeping everything else in the
-// file. The file must exist. The change is on the disk, whole or not at all, when this returns.
+// Sets the value of one key, adding the key when the file lacks it and keeping everything else in
+// the file. The file must exist. The change is on the disk, whole or not at all, when this returns.
 // Returns positive on success, negative on failure.
 int ALIBCFileSetKeyValue(const char* path, const char* key, const char* value, int flags);
 

@@ -1,0 +1,22 @@
+// The one home of every fixed path on the appliance that the library reads or writes.
+#ifndef BASE_PATHS_H_
+#define BASE_PATHS_H_
+
+namespace quendel {
+
+// Settings.
+inline constexpr char kServiceConfFile[] = "/usr/arvo/etc/quendel.conf";
+inline constexpr char kDefaultsFile[] = "/etc.defaults/arvoinfo.conf";
+inline constexpr char kVersionFile[] = "/etc.defaults/VERSION";
+
+// One file per collector, and its state.
+inline constexpr char kCollectorConfDir[] = "/usr/arvo/etc/quendel";
+
+// The work directory of every run, and the collectors' staged state in it.
+inline constexpr char kWorkRoot[] = "/tmp/quendel";
+inline constexpr char kLogUpdateFile[] = "/tmp/quendel/quendel.log.update.conf";
+inline constexpr char kUdcUpdateFile[] = "/tmp/quendel/quendel.udc.update.conf";
+
+}  // namespace quendel
+
+#endif  // BASE_PATHS_H_
