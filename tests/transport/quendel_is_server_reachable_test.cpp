@@ -1,0 +1,118 @@
+// The connect test: pairs of successes within six attempts.
+#include <dirent.h>
+#include <gmock/gmock.h>
+
+#include "quendel.h"
+#include "support/accept_pattern.h"
+#include "support/appliance.h"
+#include "support/faults.h"
+#include "support/log.h"
+
+using namespace quendel::test;
+using testing::AllOf;
+using testing::Each;
+using testing::ElementsAre;
+using testing::IsEmpty;
+using testing::SizeIs;
+
+namespace {
+
+constexpr char kUnit[] = "util.cpp";
+constexpr char kRefused[] = "connect to a socket failed, errno: Connection refused";
+
+// The open descriptors of this process.
+int OpenDescriptors() {
+  int count = 0;
+  DIR* folder = opendir("/proc/self/fd");
+  while (readdir(folder) != nullptr) {
+    ++count;
+  }
+  closedir(folder);
+  return count;
+}
+
+// One run of the test against a server that accepts (a) and refuses (r) in this order.
+struct Outcome {
+  int result;
+  int attempts;
+  int slept_seconds;
+};
+
+Outcome Against(const std::string& pattern) {
+  AcceptPattern server(pattern);
+  const int result = QUENDELIsServerReachable();
+  return {result, Calls("connect"), SleptSeconds()};
+}
+
+void ExpectOutcome(const std::string& pattern, int result, int attempts) {
+  const Outcome outcome = Against(pattern);
+  EXPECT_EQ(outcome.result, result);
+  EXPECT_EQ(outcome.attempts, attempts);
+  EXPECT_EQ(outcome.slept_seconds, attempts - 1);
+}
+
+}  // namespace
+
+TEST(IsServerReachableTest, IsTrueAfterTwoConnectionsASecondApart) {
+  ExpectOutcome("aaaaaa", 1, 2);
+  EXPECT_THAT(Log(), IsEmpty());
+}
+
+TEST(IsServerReachableTest, CountsOnlyConnectionsInARow) {
+  ExpectOutcome("araaaa", 1, 4);
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, kRefused)));
+}
+
+TEST(IsServerReachableTest, TakesAPairAtTheLastTwoAttempts) {
+  ExpectOutcome("rrrraa", 1, 6);
+}
+
+TEST(IsServerReachableTest, IsFalseWhenOnlyTheSixthAttemptSucceeds) {
+  ExpectOutcome("rrrrra", 0, 6);
+  EXPECT_THAT(Log(), AllOf(SizeIs(5), Each(Logged(kUnit, kRefused))));
+}
+
+TEST(IsServerReachableTest, IsFalseWhenSuccessesAlternate) {
+  ExpectOutcome("ararar", 0, 6);
+}
+
+TEST(IsServerReachableTest, IsFalseWhenSuccessesAlternateTheOtherWay) {
+  ExpectOutcome("rarara", 0, 6);
+}
+
+TEST(IsServerReachableTest, IsFalseWhenEveryAttemptFails) {
+  ExpectOutcome("rrrrrr", 0, 6);
+  EXPECT_THAT(Log(), SizeIs(6));
+}
+
+TEST(IsServerReachableTest, LeavesTheSocketsOfFailedAttemptsOpen) {
+  AcceptPattern server("rrrrrr");
+  const int before = OpenDescriptors();
+  QUENDELIsServerReachable();
+  EXPECT_EQ(OpenDescriptors(), before + 6);
+}
+
+TEST(IsServerReachableTest, ClosesTheSocketsOfConnections) {
+  AcceptPattern server("aaaaaa");
+  const int before = OpenDescriptors();
+  ASSERT_EQ(QUENDELIsServerReachable(), 1);
+  EXPECT_EQ(OpenDescriptors(), before);
+}
+
+TEST(IsServerReachableTest, GivesUpAtOnceOnAHostThatIsNotKnown) {
+  WriteFile("/etc.defaults/arvoinfo.conf", "quendel_server=no.such.host\n");
+  EXPECT_EQ(QUENDELIsServerReachable(), 0);
+  EXPECT_THAT(Log(),
+              ElementsAre(Logged(
+                  kUnit, "Failed to get IP address of target hostname: no.such.host")));
+  EXPECT_EQ(Calls("socket"), 0);
+  EXPECT_EQ(SleptSeconds(), 0);
+}
+
+TEST(IsServerReachableTest, TriesOnlyTheFirstAddress) {
+  WriteFile("/etc/hosts", "127.0.0.2 support.test\n127.0.0.1 support.test\n");
+  WriteFile("/etc/host.conf", "multi on\n");
+  AcceptPattern server("aaaaaa");  // listens on 127.0.0.1 only
+  EXPECT_EQ(QUENDELIsServerReachable(), 0);
+  EXPECT_THAT(Log(), SizeIs(6));
+}
