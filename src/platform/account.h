@@ -18,7 +18,8 @@ constexpr size_t kAccountFieldBOffset = 12288;
 extern "C" {
 
 // Fills a zeroed record of platform::kAccountRecordBytes bytes with the signed-in account.
-// Returns negative when no account is signed in or it cannot be read.
+// A text that does not fit the room up to the next one is cut.
+// Returns 0, or negative when no account is signed in or it cannot be read.
 int ARVOMYHUBAccountGet(void* record);
 }
 

@@ -1,4 +1,6 @@
 // The platform's last error.
+//
+// An operation that fails because of a system call leaves errno as that call set it, too.
 #ifndef PLATFORM_ERROR_H_
 #define PLATFORM_ERROR_H_
 

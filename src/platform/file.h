@@ -4,7 +4,7 @@
 
 extern "C" {
 
-// Returns 1 when the path exists, whatever it is, else 0.
+// Returns 1 when the path exists, whatever it is, else 0. A link to nothing does not exist.
 int ALIBCFileExist(const char* path);
 
 // Returns 1 when the path is a directory, or a link to one; 0 when it is something else or does not

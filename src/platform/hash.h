@@ -11,7 +11,7 @@ struct ALIBSZLIST;
 extern "C" {
 
 // Makes an empty hash with room for `size` pairs; it grows when that is not enough.
-// Returns null when memory ran out. ALIBCSzHashFree() takes it back.
+// Returns null when memory ran out or the size is negative. ALIBCSzHashFree() takes it back.
 ALIBSZHASH* ALIBCSzHashAlloc(int size);
 
 // Frees a hash and everything in it; null is allowed.
@@ -20,7 +20,8 @@ void ALIBCSzHashFree(ALIBSZHASH* hash);
 // Looks a key up. Returns the value, which the hash keeps, or null when the key is absent.
 const char* ALIBCSzHashGetValue(ALIBSZHASH* hash, const char* key);
 
-// Stores a value under a key, replacing what was there. Returns negative on failure.
+// Stores a value under a key, replacing what was there; the value may be one that the hash keeps.
+// Returns 0, or negative on failure.
 int ALIBCSzHashSetValue(ALIBSZHASH** hash, const char* key, const char* value);
 
 // Takes every pair out and leaves the hash usable.

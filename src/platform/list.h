@@ -7,7 +7,7 @@ struct ALIBSZLIST;
 extern "C" {
 
 // Makes an empty list with room for `size` strings; it grows when that is not enough.
-// Returns null when memory ran out. ALIBCSzListFree() takes it back.
+// Returns null when memory ran out or the size is negative. ALIBCSzListFree() takes it back.
 ALIBSZLIST* ALIBCSzListAlloc(int size);
 
 // Frees a list and everything in it; null is allowed.

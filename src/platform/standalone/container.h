@@ -1,0 +1,20 @@
+// What the platform's containers are made of, for the operations that fill them.
+#ifndef PLATFORM_STANDALONE_CONTAINER_H_
+#define PLATFORM_STANDALONE_CONTAINER_H_
+
+#include <string>
+#include <unordered_map>
+#include <vector>
+
+#include "platform/hash.h"
+#include "platform/list.h"
+
+struct ALIBSZHASH {
+  std::unordered_map<std::string, std::string> pairs;
+};
+
+struct ALIBSZLIST {
+  std::vector<std::string> texts;
+};
+
+#endif  // PLATFORM_STANDALONE_CONTAINER_H_
