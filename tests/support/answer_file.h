@@ -1,0 +1,24 @@
+// How a test hands its answers to the server: as files.
+#ifndef SUPPORT_ANSWER_FILE_H_
+#define SUPPORT_ANSWER_FILE_H_
+
+#include <string>
+
+#include "support/server.h"
+
+namespace quendel::test {
+
+// Where the server looks for answers and leaves requests unless it is told otherwise.
+constexpr char kServerFolder[] = "/run/test-server";
+
+// The text of an answer file: a line for each member that matters ("status 500", "delay_ms 20",
+// "header Name: value"), an empty line, the body. `tail` is cut off the body's end: "tail 3" makes
+// its last three bytes the tail.
+std::string TextFromAnswer(const ScriptedAnswer& answer);
+
+// Reads one. Returns false for a text that is not an answer.
+bool AnswerFromText(const std::string& text, ScriptedAnswer& answer);
+
+}  // namespace quendel::test
+
+#endif  // SUPPORT_ANSWER_FILE_H_

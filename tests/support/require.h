@@ -1,0 +1,22 @@
+// For what the kit itself cannot do without.
+#ifndef SUPPORT_REQUIRE_H_
+#define SUPPORT_REQUIRE_H_
+
+#include <cstdio>
+#include <cstdlib>
+#include <string>
+
+namespace quendel::test {
+
+// Ends the program with a sentence when something that a test stands on is missing: going on would
+// prove nothing.
+inline void Require(bool holds, const std::string& otherwise) {
+  if (!holds) {
+    fprintf(stderr, "test kit: %s\n", otherwise.c_str());
+    abort();
+  }
+}
+
+}  // namespace quendel::test
+
+#endif  // SUPPORT_REQUIRE_H_
