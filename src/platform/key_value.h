@@ -2,10 +2,14 @@
 //
 // Reading never sees half of a change: it gets the file as it was before or after one. `flags` is
 // always 0.
+//
+// A flat file holds `key=value` lines. A sectioned one holds groups of them, each below a `[name]`
+// line; the flat operations pass over those lines.
 #ifndef PLATFORM_KEY_VALUE_H_
 #define PLATFORM_KEY_VALUE_H_
 
 struct ALIBSZHASH;
+struct ALIBSZLIST;
 
 extern "C" {
 
@@ -22,6 +26,23 @@ int ALIBCFileSetKeyValue(const char* path, const char* key, const char* value, i
 // Reads every pair of the file into a hash, over what the hash already holds.
 // Returns the number of pairs read, negative when the file cannot be read.
 int ALIBCFileGetPair(const char* path, ALIBSZHASH** hash);
+
+// Appends a section with every pair of the hash, in the order of ALIBCSzHashEnumKey(), by one
+// write; creates the file when it is missing. A section that was cut short, by a crash or a full
+// disk, is no section to the two operations below. What is appended is not synchronised: it is
+// meant for a run that starts afresh after a power failure. Returns positive on success, negative
+// on failure with the file as it was.
+int ALIBCFileAddSection(const char* path, const char* section, ALIBSZHASH* hash, int flags);
+
+// Appends the names of the file's sections to a list, in file order; a name that several sections
+// bear comes once. Returns the number of names, negative when the file cannot be read.
+int ALIBCFileEnumSection(const char* path, ALIBSZLIST** sections);
+
+// Reads the pairs of one section into a hash, over what the hash already holds. Where several
+// sections bear the name, a later one goes over an earlier one. Walking through a file's sections
+// in turn costs no more than reading the file once, as long as it does not change. Returns positive
+// on success; negative when there is no such section or the file cannot be read.
+int ALIBCFileGetSection(const char* path, const char* section, ALIBSZHASH** hash);
 }
 
 #endif  // PLATFORM_KEY_VALUE_H_

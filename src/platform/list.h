@@ -28,6 +28,11 @@ int ALIBCSzListSize(const ALIBSZLIST* list);
 
 // Returns the string at an index, which the list keeps, or null when the index is out of range.
 const char* ALIBCSzListGet(const ALIBSZLIST* list, int index);
+
+// Splits a text at every byte that is one of `separators` and appends the pieces to a list. Empty
+// pieces are dropped, so a text of nothing but separators gives none.
+// Returns the number of pieces, negative on failure.
+int ALIBCStrTok(const char* text, const char* separators, ALIBSZLIST** list);
 }
 
 #endif  // PLATFORM_LIST_H_
