@@ -9,9 +9,9 @@ namespace ARVO {
 class APIRunner {
  public:
   // Calls a method of an API as a user of the device. `out` gets the reply: an object with
-  // "success", and, when that is false, "error" with a numeric "code": 101 for a bad parameter, 102
-  // for an unknown API, 103 for an unknown method, 104 for an unknown version, 105 for a user who
-  // may not call it, 100 for anything else.
+  // "success" and, when that is false, "error" with a numeric "code": 400 for parameters that the
+  // method does not take, 403 for a user who may not call it, 404 for an API, version or method
+  // that is not there, 500 when the method itself failed.
   static void Exec(Json::Value& out, const char* api, int version, const char* method,
                    const Json::Value& params, const char* user);
 };
