@@ -17,4 +17,11 @@ struct ALIBSZLIST {
   std::vector<std::string> texts;
 };
 
+namespace platform {
+
+// Returns a hash's keys in the order that ALIBCSzHashEnumKey() promises.
+std::vector<std::string> SortedKeys(const ALIBSZHASH& hash);
+
+}  // namespace platform
+
 #endif  // PLATFORM_STANDALONE_CONTAINER_H_

@@ -18,7 +18,12 @@ enum ErrorCode : int {
   kErrorLockFailed = 0x0500,       // the lock beside the file could not be made or taken
   kErrorWriteFailed = 0x0600,      // the new file could not be written; the old one is as it was
   kErrorNotSynchronised = 0x0601,  // the new file is in place, but may not survive a power failure
+  kErrorRemoveFailed = 0x0602,     // something below the directory could not be removed
   kErrorNoAccount = 0x0700,        // no account is signed in on this device
+  kErrorNotStarted = 0x0800,       // the program, or the child process, could not be started
+  kErrorStatusLost = 0x0801,       // it ran, but how it ended is not known
+  kErrorNoAnswer = 0x0a00,         // no answer is there to be taken
+  kErrorNoTimeZone = 0x0900,       // no time zone is configured, or the name is none
 };
 
 // Sets the calling thread's last error. Returns -1, the result of most failed operations.

@@ -8,6 +8,16 @@
 #include "platform/standalone/container.h"
 #include "platform/standalone/error_code.h"
 
+std::vector<std::string> platform::SortedKeys(const ALIBSZHASH& hash) {
+  std::vector<std::string> keys;
+  keys.reserve(hash.pairs.size());
+  for (const auto& pair : hash.pairs) {
+    keys.push_back(pair.first);
+  }
+  std::sort(keys.begin(), keys.end(), std::greater<>());
+  return keys;
+}
+
 ALIBSZHASH* ALIBCSzHashAlloc(int size) try {
   if (size < 0) {
     platform::FailForArgument();
@@ -59,12 +69,7 @@ int ALIBCSzHashEnumKey(ALIBSZHASH* hash, ALIBSZLIST** keys) try {
   if (hash == nullptr || keys == nullptr || *keys == nullptr) {
     return platform::FailForArgument();
   }
-  std::vector<std::string> sorted;
-  sorted.reserve(hash->pairs.size());
-  for (const auto& pair : hash->pairs) {
-    sorted.push_back(pair.first);
-  }
-  std::sort(sorted.begin(), sorted.end(), std::greater<>());
+  std::vector<std::string> sorted = platform::SortedKeys(*hash);
   std::vector<std::string>& texts = (*keys)->texts;
   // Once there is room for all of them nothing can fail, so the list never gets a part of the keys.
   texts.reserve(texts.size() + sorted.size());

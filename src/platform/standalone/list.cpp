@@ -2,6 +2,7 @@
 #include "platform/list.h"
 
 #include <algorithm>
+#include <cstring>
 #include <memory>
 
 #include "platform/standalone/container.h"
@@ -57,4 +58,21 @@ const char* ALIBCSzListGet(const ALIBSZLIST* list, int index) {
     return nullptr;
   }
   return list->texts[static_cast<size_t>(index)].c_str();
+}
+
+int ALIBCStrTok(const char* text, const char* separators, ALIBSZLIST** list) try {
+  if (text == nullptr || separators == nullptr || list == nullptr || *list == nullptr) {
+    return platform::FailForArgument();
+  }
+  std::vector<std::string> pieces;
+  for (text += strspn(text, separators); *text != '\0'; text += strspn(text, separators)) {
+    const size_t length = strcspn(text, separators);
+    pieces.emplace_back(text, length);
+    text += length;
+  }
+  std::vector<std::string>& texts = (*list)->texts;
+  texts.insert(texts.end(), pieces.begin(), pieces.end());
+  return static_cast<int>(pieces.size());
+} catch (...) {
+  return platform::FailForException();
 }
