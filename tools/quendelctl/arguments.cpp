@@ -1,0 +1,71 @@
+// Readers for the arguments that several commands share.
+#include "arguments.h"
+
+#include <json/reader.h>
+
+#include <CLI/CLI.hpp>
+#include <cerrno>
+#include <charconv>
+#include <cstdio>
+#include <cstring>
+#include <memory>
+
+namespace quendelctl {
+namespace {
+
+[[noreturn]] void FailToRead(const std::string& argument, const std::string& name) {
+  throw CLI::ValidationError(argument, "cannot read " + name + ": " + strerror(errno));
+}
+
+std::string ReadWhole(const std::string& argument, FILE* file, const std::string& name) {
+  std::string text;
+  char chunk[4096];
+  size_t got = 0;
+  while ((got = fread(chunk, 1, sizeof(chunk), file)) > 0) {
+    text.append(chunk, got);
+  }
+  if (ferror(file) != 0) {
+    FailToRead(argument, name);
+  }
+  return text;
+}
+
+std::string ReadFileOrStandardInput(const std::string& argument, const std::string& name) {
+  if (name == "-") {
+    return ReadWhole(argument, stdin, "the standard input");
+  }
+  const std::unique_ptr<FILE, int (*)(FILE*)> file(fopen(name.c_str(), "rbe"), fclose);
+  if (file == nullptr) {
+    FailToRead(argument, name);
+  }
+  return ReadWhole(argument, file.get(), name);
+}
+
+}  // namespace
+
+int ReadNumber(const std::string& argument, const std::string& text) {
+  int number = 0;
+  const char* end = text.data() + text.size();
+  const auto [stop, error] = std::from_chars(text.data(), end, number);
+  if (error != std::errc() || stop != end) {
+    throw CLI::ValidationError(argument, text + " is not a whole number that fits 32 bits");
+  }
+  return number;
+}
+
+Json::Value ReadJson(const std::string& argument, const std::string& text) {
+  const std::string json = text.rfind('{', 0) == 0 ? text : ReadFileOrStandardInput(argument, text);
+  Json::CharReaderBuilder builder;
+  Json::CharReaderBuilder::strictMode(&builder.settings_);
+  builder["strictRoot"] = false;
+  const std::unique_ptr<Json::CharReader> reader(builder.newCharReader());
+  Json::Value value;
+  std::string errors;
+  if (!reader->parse(json.data(), json.data() + json.size(), &value, &errors)) {
+    errors.erase(errors.find_last_not_of('\n') + 1);
+    throw CLI::ValidationError(argument, "not JSON: " + errors);
+  }
+  return value;
+}
+
+}  // namespace quendelctl

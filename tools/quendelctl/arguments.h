@@ -1,0 +1,22 @@
+// Readers for the arguments that several commands share.
+#ifndef QUENDELCTL_ARGUMENTS_H_
+#define QUENDELCTL_ARGUMENTS_H_
+
+#include <json/value.h>
+
+#include <string>
+
+namespace quendelctl {
+
+// Each of these throws a CLI::ValidationError, which names the argument, for a text it cannot read.
+
+// Reads a whole number in decimal, with nothing around it.
+int ReadNumber(const std::string& argument, const std::string& text);
+
+// Reads a JSON value from what the user gave: an object's JSON text, which begins with "{", or else
+// the name of a file that holds JSON of any kind, "-" for the standard input.
+Json::Value ReadJson(const std::string& argument, const std::string& text);
+
+}  // namespace quendelctl
+
+#endif  // QUENDELCTL_ARGUMENTS_H_

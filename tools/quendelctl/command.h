@@ -1,0 +1,38 @@
+// What a command is, to the tables that hold the commands and to the program that runs one.
+#ifndef QUENDELCTL_COMMAND_H_
+#define QUENDELCTL_COMMAND_H_
+
+#include <json/value.h>
+
+#include <CLI/CLI.hpp>
+#include <functional>
+#include <string>
+#include <vector>
+
+namespace quendelctl {
+
+// What came of a command. The reason of a failure is in the library's log lines.
+struct Result {
+  bool success = false;
+  Json::Value members = Json::objectValue;  // printed with --json, together with "success"
+  std::vector<std::string> lines;           // printed without; may hold any bytes
+};
+
+using Action = std::function<Result()>;
+
+struct Command {
+  const char* name;
+  const char* summary;   // one line, for the list of commands
+  const char* examples;  // the end of the command's own help text
+
+  // Declares the command's arguments. The action runs once they are read; it may still throw a
+  // CLI::ParseError, as long as it has not done anything.
+  Action (*declare)(CLI::App& command);
+};
+
+extern const std::vector<Command> kConversationCommands;
+extern const std::vector<Command> kDeviceCommands;
+
+}  // namespace quendelctl
+
+#endif  // QUENDELCTL_COMMAND_H_

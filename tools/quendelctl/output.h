@@ -1,0 +1,28 @@
+// What the program writes to the standard output.
+#ifndef QUENDELCTL_OUTPUT_H_
+#define QUENDELCTL_OUTPUT_H_
+
+#include <json/value.h>
+
+#include <string>
+
+#include "command.h"
+
+namespace quendelctl {
+
+// Prints what came of a command: one line of JSON, in ASCII, or the lines for a reader.
+void PrintResult(const Result& result, bool json);
+
+// Prints a text of the program's own as it is.
+void PrintText(const std::string& text);
+
+// Closes the standard output. Throws when anything of what was printed did not get there.
+void FinishOutput();
+
+// Returns the value's JSON text on one line, for a reader: characters beyond ASCII stay what they
+// are.
+std::string JsonForReader(const Json::Value& value);
+
+}  // namespace quendelctl
+
+#endif  // QUENDELCTL_OUTPUT_H_

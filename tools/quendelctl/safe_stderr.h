@@ -1,0 +1,28 @@
+// The standard error output, made safe to show on a terminal.
+#ifndef QUENDELCTL_SAFE_STDERR_H_
+#define QUENDELCTL_SAFE_STDERR_H_
+
+#include <sys/types.h>
+
+namespace quendelctl {
+
+// While one of these lives, what is written to the standard error output passes through a process
+// that escapes whatever could act on a terminal. The library's log lines quote the server's replies
+// as they came, and syslog() prints them without a look at them.
+class SafeStderr {
+ public:
+  // Throws std::system_error when the system has no pipe or process left.
+  SafeStderr();
+  // Returns once everything has been shown.
+  ~SafeStderr();
+  SafeStderr(const SafeStderr&) = delete;
+  SafeStderr& operator=(const SafeStderr&) = delete;
+
+ private:
+  int original_;
+  pid_t filter_;
+};
+
+}  // namespace quendelctl
+
+#endif  // QUENDELCTL_SAFE_STDERR_H_
