@@ -1,0 +1,52 @@
+# What "cmake --install" puts under the prefix: the libraries, their headers, what a build needs to
+# find them, the companion programs and the manual pages. Nothing in it names the prefix, so the
+# installed tree can be moved as a whole.
+include(CMakePackageConfigHelpers)
+
+set(cmake_package_dir ${CMAKE_INSTALL_LIBDIR}/cmake/quendel)
+set(pkgconfig_dir ${CMAKE_INSTALL_LIBDIR}/pkgconfig)
+
+# The vendor's platform libraries come with the device; the stand-alone ones come with libquendel,
+# which then finds the shared one beside itself.
+set(libraries quendel quendel_static)
+set(platform_libraries ${QUENDEL_PLATFORM_LIBRARIES})
+if(NOT QUENDEL_PLATFORM_LIBRARIES)
+  set(platform_libraries quendel-platform)
+  list(APPEND libraries quendel-platform quendel-platform_static)
+  set_target_properties(quendel PROPERTIES INSTALL_RPATH "$ORIGIN")
+endif()
+install(TARGETS ${libraries} EXPORT quendel-targets
+  LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR}
+  ARCHIVE DESTINATION ${CMAKE_INSTALL_LIBDIR})
+install(DIRECTORY include/ DESTINATION ${CMAKE_INSTALL_INCLUDEDIR} FILES_MATCHING PATTERN "*.h")
+
+install(EXPORT quendel-targets NAMESPACE quendel:: DESTINATION ${cmake_package_dir})
+write_basic_package_version_file(quendel-config-version.cmake COMPATIBILITY SameMajorVersion)
+install(FILES cmake/quendel-config.cmake ${CMAKE_CURRENT_BINARY_DIR}/quendel-config-version.cmake
+  DESTINATION ${cmake_package_dir})
+
+# What a static libquendel leaves to its user to link. The libraries are named one by one, because
+# the name of a package would pull in what a static libcurl needs, and libcurl is a shared one here.
+set(private_libraries "")
+foreach(library IN LISTS platform_libraries)
+  if(NOT library MATCHES "^-|/")
+    set(library -l${library})
+  endif()
+  list(APPEND private_libraries ${library})
+endforeach()
+list(APPEND private_libraries ${CURL_LDFLAGS} ${CRYPTO_LDFLAGS})
+foreach(directory IN LISTS CMAKE_CXX_IMPLICIT_LINK_DIRECTORIES)
+  list(REMOVE_ITEM private_libraries -L${directory})
+endforeach()
+list(JOIN private_libraries " " private_libraries)
+file(RELATIVE_PATH prefix_from_pkgconfig /${pkgconfig_dir} /)
+string(REGEX REPLACE "/$" "" prefix_from_pkgconfig ${prefix_from_pkgconfig})
+configure_file(cmake/quendel.pc.in quendel.pc @ONLY)
+install(FILES ${CMAKE_CURRENT_BINARY_DIR}/quendel.pc DESTINATION ${pkgconfig_dir})
+
+if(QUENDEL_BUILD_TOOLS)
+  file(RELATIVE_PATH libraries_from_programs /${CMAKE_INSTALL_BINDIR} /${CMAKE_INSTALL_LIBDIR})
+  set_target_properties(quendelctl PROPERTIES INSTALL_RPATH "$ORIGIN/${libraries_from_programs}")
+  install(TARGETS quendelctl RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR})
+  install(FILES docs/man/quendelctl.1 DESTINATION ${CMAKE_INSTALL_MANDIR}/man1)
+endif()
