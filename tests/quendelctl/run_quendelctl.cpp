@@ -1,0 +1,65 @@
+// Runs the real quendelctl and keeps what it printed.
+#include "run_quendelctl.h"
+
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <json/reader.h>
+#include <spawn.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cstdlib>
+
+#include "support/appliance.h"
+
+namespace quendel::test {
+namespace {
+
+Output Run(const std::string& program, std::vector<std::string> arguments,
+           const std::string& input) {
+  WriteFile("/tmp/run/in", input);
+  arguments.insert(arguments.begin(), program);
+  std::vector<char*> argv;
+  for (std::string& argument : arguments) {
+    argv.push_back(argument.data());
+  }
+  argv.push_back(nullptr);
+
+  constexpr int kWrite = O_WRONLY | O_CREAT | O_TRUNC;
+  posix_spawn_file_actions_t actions;
+  posix_spawn_file_actions_init(&actions);
+  posix_spawn_file_actions_addopen(&actions, STDIN_FILENO, "/tmp/run/in", O_RDONLY, 0);
+  posix_spawn_file_actions_addopen(&actions, STDOUT_FILENO, "/tmp/run/out", kWrite, 0600);
+  posix_spawn_file_actions_addopen(&actions, STDERR_FILENO, "/tmp/run/err", kWrite, 0600);
+  pid_t child = 0;
+  EXPECT_EQ(posix_spawn(&child, argv[0], &actions, nullptr, argv.data(), environ), 0);
+  posix_spawn_file_actions_destroy(&actions);
+  int status = 0;
+  EXPECT_EQ(waitpid(child, &status, 0), child);
+  return {WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status),
+          ReadFile("/tmp/run/out"), ReadFile("/tmp/run/err")};
+}
+
+}  // namespace
+
+Output Quendelctl(const std::vector<std::string>& arguments, const std::string& input) {
+  return Run(QUENDELCTL, arguments, input);
+}
+
+Output Shell(const std::string& command) {
+  setenv("quendelctl", QUENDELCTL, 1);
+  return Run("/bin/sh", {"-c", command}, "");
+}
+
+Json::Value FromJsonLine(const std::string& line) {
+  EXPECT_EQ(std::count(line.begin(), line.end(), '\n'), 1) << line;
+  EXPECT_TRUE(std::all_of(line.begin(), line.end(), [](char c) {
+    return c == '\n' || (c >= ' ' && c <= '~');
+  })) << line;
+  Json::Value value;
+  EXPECT_TRUE(Json::Reader(Json::Features::strictMode()).parse(line, value)) << line;
+  return value;
+}
+
+}  // namespace quendel::test
