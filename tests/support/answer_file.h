@@ -4,7 +4,7 @@
 
 #include <string>
 
-#include "support/server.h"
+#include "support/scripted_answer.h"
 
 namespace quendel::test {
 
