@@ -4,6 +4,7 @@
 #include "quendel.h"
 #include "support/appliance.h"
 #include "support/faults.h"
+#include "support/json.h"
 #include "support/log.h"
 #include "support/server.h"
 
@@ -99,10 +100,9 @@ TEST(HeartbeatTest, FailsWhenTheServerRefuses) {
   SetIdentity();
   Answer({.body = R"({"success":false,"actions":[]})"});
   ExpectFailure();
-  EXPECT_THAT(Log(),
-              ElementsAre(Logged(kUnit,
-                                 "Failed to send heartbeat, server return failed. "
-                                 "[{\"actions\":[],\"success\":false}]")));
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit,
+                                        "Failed to send heartbeat, server return failed. "
+                                        "[{\"actions\":[],\"success\":false}]")));
 }
 
 TEST(HeartbeatTest, FailsOnABadStatusWhateverTheReplySays) {

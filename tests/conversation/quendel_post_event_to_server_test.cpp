@@ -6,6 +6,7 @@
 #include "quendel.h"
 #include "support/appliance.h"
 #include "support/faults.h"
+#include "support/json.h"
 #include "support/log.h"
 #include "support/server.h"
 
@@ -37,9 +38,8 @@ TEST(PostEventToServerTest, DescribesTheDeviceWhenTheServiceIsEnabled) {
   Json::Value reply;
   EXPECT_EQ(QUENDELPostEventToServer(QUENDEL_EVENT_ENABLE, reply, JsonOf(R"({"model":"X"})")), 0);
   EXPECT_EQ(Requests().at(0).line, "POST /action/a1/b2/S1 HTTP/1.1");
-  EXPECT_EQ(JsonOf(Requests()[0].body),
-            JsonOf(R"({"action":"enable","hmx_account_email":"mail1",)"
-                   R"("hmx_info":{"model":"X"},"contact":[]})"));
+  EXPECT_EQ(JsonOf(Requests()[0].body), JsonOf(R"({"action":"enable","hmx_account_email":"mail1",)"
+                                               R"("hmx_info":{"model":"X"},"contact":[]})"));
   EXPECT_THAT(Log(), IsEmpty());
 }
 
@@ -145,9 +145,9 @@ TEST(PostEventToServerTest, FailsWhenTheContactListCannotBeRead) {
   SetIdentity();
   WriteFile(std::string(kConf) + "/a-directory-of-that-name", "");
   ExpectRefusal(QUENDEL_EVENT_REBOOT, "Failed to get quendel config");
-  EXPECT_THAT(Log(), ElementsAre(Logged("quendel_get_conf",
-                                        "Failed to get quendel configuration file"),
-                                 Logged(kUnit, "Failed to get quendel config")));
+  EXPECT_THAT(Log(),
+              ElementsAre(Logged("quendel_get_conf", "Failed to get quendel configuration file"),
+                          Logged(kUnit, "Failed to get quendel config")));
 }
 
 TEST(PostEventToServerTest, AsksForTheAccountBeforeTheContactList) {

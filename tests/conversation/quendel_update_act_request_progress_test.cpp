@@ -6,6 +6,7 @@
 #include "quendel.h"
 #include "support/appliance.h"
 #include "support/faults.h"
+#include "support/json.h"
 #include "support/log.h"
 #include "support/server.h"
 

@@ -102,9 +102,8 @@ TEST(IsServerReachableTest, ClosesTheSocketsOfConnections) {
 TEST(IsServerReachableTest, GivesUpAtOnceOnAHostThatIsNotKnown) {
   WriteFile("/etc.defaults/arvoinfo.conf", "quendel_server=no.such.host\n");
   EXPECT_EQ(QUENDELIsServerReachable(), 0);
-  EXPECT_THAT(Log(),
-              ElementsAre(Logged(
-                  kUnit, "Failed to get IP address of target hostname: no.such.host")));
+  EXPECT_THAT(Log(), ElementsAre(Logged(
+                         kUnit, "Failed to get IP address of target hostname: no.such.host")));
   EXPECT_EQ(Calls("socket"), 0);
   EXPECT_EQ(SleptSeconds(), 0);
 }

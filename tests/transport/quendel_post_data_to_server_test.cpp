@@ -5,6 +5,7 @@
 #include "quendel.h"
 #include "support/appliance.h"
 #include "support/faults.h"
+#include "support/json.h"
 #include "support/log.h"
 #include "support/server.h"
 
@@ -56,11 +57,10 @@ TEST(PostDataToServerTest, SendsTheHeadersInTheirOrder) {
   const Request request = Requests()[0];
   EXPECT_EQ(request.line, "POST /a/b HTTP/1.1");
   // Host is libcurl's own, and so is the length; libcurl's User-Agent is off by default.
-  EXPECT_THAT(request.headers,
-              ElementsAre(Pair("Host", "support.test:51790"),
-                          Pair("Content-Type", "application/json"),
-                          Pair("Accept", "application/json"), Pair("charsets", "utf-8"),
-                          Pair("Content-Length", "7")));
+  EXPECT_THAT(request.headers, ElementsAre(Pair("Host", "support.test:51790"),
+                                           Pair("Content-Type", "application/json"),
+                                           Pair("Accept", "application/json"),
+                                           Pair("charsets", "utf-8"), Pair("Content-Length", "7")));
 }
 
 TEST(PostDataToServerTest, SendsTheRequestsJson) {
@@ -108,8 +108,8 @@ TEST(PostDataToServerTest, FailsOnAnyOtherStatusAndStillGivesTheReply) {
   Json::Value response;
   EXPECT_EQ(QUENDELPostDataToServer(kUrl, Object("k", 1), response), -1);
   EXPECT_EQ(response, Object("error", 1));
-  EXPECT_THAT(Log(), ElementsAre(Logged(
-                         kUnit, "Failed to send data '{\"k\":1}', server return 500")));
+  EXPECT_THAT(Log(),
+              ElementsAre(Logged(kUnit, "Failed to send data '{\"k\":1}', server return 500")));
 }
 
 TEST(PostDataToServerTest, TakesNoOtherStatusForSuccess) {
@@ -204,10 +204,9 @@ TEST(PostDataToServerTest, SetsItsNineOptionsInOrderAndNoOther) {
   Json::Value response;
   ASSERT_EQ(QUENDELPostDataToServer(kUrl, Json::Value(), response), 0);
   std::vector<std::string> expected;
-  for (CURLoption option :
-       {CURLOPT_HTTPHEADER, CURLOPT_URL, CURLOPT_PORT, CURLOPT_SSL_VERIFYPEER,
-        CURLOPT_SSL_VERIFYHOST, CURLOPT_POSTFIELDS, CURLOPT_POSTFIELDSIZE, CURLOPT_WRITEFUNCTION,
-        CURLOPT_WRITEDATA}) {
+  for (CURLoption option : {CURLOPT_HTTPHEADER, CURLOPT_URL, CURLOPT_PORT, CURLOPT_SSL_VERIFYPEER,
+                            CURLOPT_SSL_VERIFYHOST, CURLOPT_POSTFIELDS, CURLOPT_POSTFIELDSIZE,
+                            CURLOPT_WRITEFUNCTION, CURLOPT_WRITEDATA}) {
     expected.push_back(std::to_string(static_cast<int>(option)));
   }
   EXPECT_EQ(Recorded(), expected);
