@@ -75,4 +75,46 @@ QUENDEL_EXPORT int QUENDELGetLocalTime(char* buf, size_t size, time_t when);
 // tell.
 QUENDEL_EXPORT int QUENDELGetDstDir(char* buf, size_t size, time_t when);
 
+// Small helpers for files and texts. None of them logs.
+
+// Copies one regular file, whole, to dst, which is created or overwritten.
+//
+// Returns the platform's own answer: 0 when the file was copied, else negative.
+QUENDEL_EXPORT int QUENDELFileCopy(const char* src, const char* dst);
+
+// Makes a directory and those above it that are missing, with the system's mkdir. `mode` is the
+// mode of the last of them; of its octal text the first seven digits count. Nothing is done for
+// exactly "." and
+// "/".
+//
+// Whether the directory was made is not told: a tool that ran and failed counts as success.
+//
+// Returns 0, or -1 when the tool could not be run.
+QUENDEL_EXPORT int QUENDELRecursiveMkdir(const char* path, unsigned int mode);
+
+// Removes a file, or a directory with all it holds, with the system's rm. Nothing is done for
+// exactly
+// "." and "/".
+//
+// Whether anything was removed is not told: a tool that ran and failed counts as success.
+//
+// Returns 0, or -1 when the tool could not be run.
+QUENDEL_EXPORT int QUENDELRecursiveRmdir(const char* path);
+
+// Writes the MD5 of all bytes of a text, NUL bytes included, into out: 32 lowercase hexadecimal
+// digits and a NUL, so out has room for at least 33 bytes. Returns nothing; never fails.
+QUENDEL_EXPORT void QUENDELMD5String(const std::string& text, char* out);
+
+// Replaces `out` by the two lowercase hexadecimal digits of each of `len` bytes; it becomes empty
+// when `len` is 0 or negative, and when memory ran out. Returns nothing.
+QUENDEL_EXPORT void QUENDELBytesToHex(std::string& out, const unsigned char* bytes, int len);
+
+// Writes the byte of each two hexadecimal digits, of either case, into out, up to `maxlen` bytes. A
+// last digit without a partner is a byte of its own. A pair that is no number is read as far as
+// strtol reads it: "zz" gives 0x00, "1z" gives 0x01, "-1" gives 0xff.
+//
+// The caller knows the number of bytes, half the digits rounded up, from the text. Returns nothing;
+// never fails.
+QUENDEL_EXPORT void QUENDELHexToBytes(const std::string& hex, unsigned char* out, int maxlen);
+
 #endif  // QUENDEL_CONF_H_
