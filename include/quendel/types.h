@@ -4,6 +4,9 @@
 
 #include <json/value.h>
 
+#include <cstdint>
+#include <string>
+
 // The service's own configuration. The field starts as a JSON null; QUENDELGetConf() fills it.
 struct QUENDELConf_t {
   // Key "contact" of "/usr/arvo/etc/quendel.conf": JSON text in the file, of any kind, usually an
@@ -29,6 +32,14 @@ enum QuendelEvent_t : int {
   QUENDEL_EVENT_REBOOT = 3,      // the device is restarting
   QUENDEL_EVENT_LOGOUT = 4,      // the cloud account was signed out
   QUENDEL_EVENT_UPDATE_INFO = 5  // the server's copy of the device's information is out of date
+};
+
+// One file of a post to the server. Copies own their texts.
+struct QUENDELSendDataParam_t {
+  uint64_t timestamp = 0;  // the moment that belongs to the file, seconds since the epoch
+  std::string type;        // the file's kind as the server knows it; empty for collected data
+  std::string path;        // absolute path of the file
+  std::string fileuuid;    // the server's identifier of the file; empty for collected data
 };
 
 #endif  // QUENDEL_TYPES_H_
