@@ -10,6 +10,7 @@
 #include <vector>
 
 #include "quendel/export.h"
+#include "quendel/types.h"
 
 // Error numbers of the appliance's web API that tell its user interface what the server answered.
 enum _tag_WEBAPI_CORE_ERR : int {
@@ -73,5 +74,36 @@ QUENDEL_EXPORT int QUENDELGetWebapiError(int code);
 //
 // Returns 1 when the server is reachable, else 0.
 QUENDEL_EXPORT int QUENDELIsServerReachable();
+
+// Posts files to the server, on TCP port 51790, as one multipart/form-data request: a part for each
+// file, in the order of `items`, and last a text part that holds a JSON array with the description
+// of each file. Every part has the name `name`. No item at all still posts the array, empty.
+//
+// Files are read from disk while they are sent, whatever their size, and must stay in place until
+// the function returns. File name and content type of a part are what libcurl derives from the
+// path.
+//
+// `meta` describes one file: it gets an empty JSON object to fill and the item, and returns 0, or
+// non-zero when it cannot. A file without a description is posted all the same and the array lacks
+// its entry, so its entries may be fewer than the files. A path that is no readable file fails the
+// whole post.
+//
+// The certificate and the host name of the server are not verified. The list of parts, some hundred
+// bytes for each file and not the files' contents, is kept until the process exits.
+//
+// Returns 0 when the server answered with status 200 and a reply that reports success, as
+// QUENDELParseResponse() judges it, else -1.
+QUENDEL_EXPORT int QUENDELPostFileToServer(const char* url, const char* name,
+                                           const std::vector<QUENDELSendDataParam_t>& items,
+                                           int (*meta)(Json::Value& info,
+                                                       const QUENDELSendDataParam_t& item));
+
+// Posts a single file, like the function above with a list of one.
+//
+// Returns what that returns.
+QUENDEL_EXPORT int QUENDELPostFileToServer(const char* url, const char* name,
+                                           const QUENDELSendDataParam_t& item,
+                                           int (*meta)(Json::Value& info,
+                                                       const QUENDELSendDataParam_t& item));
 
 #endif  // QUENDEL_TRANSPORT_H_
