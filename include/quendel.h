@@ -15,6 +15,7 @@
 #define QUENDEL_H_
 
 #include "quendel/collectors.h"
+#include "quendel/collect.h"
 #include "quendel/conf.h"
 #include "quendel/conversation.h"
 #include "quendel/transport.h"
