@@ -14,8 +14,8 @@
 #ifndef QUENDEL_H_
 #define QUENDEL_H_
 
-#include "quendel/collectors.h"
 #include "quendel/collect.h"
+#include "quendel/collectors.h"
 #include "quendel/conf.h"
 #include "quendel/conversation.h"
 #include "quendel/transport.h"
