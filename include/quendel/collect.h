@@ -1,10 +1,100 @@
-// A collection run, and the channel between the processes that drive one.
+// The collection run: what is new on the device is gathered, packed into one archive, delivered,
+// and only then counted as collected. And the channel between the processes that drive one.
 #ifndef QUENDEL_COLLECT_H_
 #define QUENDEL_COLLECT_H_
+
+#include <json/value.h>
 
 #include <cstddef>
 
 #include "quendel/export.h"
+
+// Runs one complete collection.
+//
+// A fresh run directory, QUENDELGetDstDir() of now, receives "log" with the new log lines, "udc"
+// with the results of the user-defined collectors, and "perf" with the files that
+// QUENDELParsePerfJson() makes of `perfSeries`. Logs and collectors are worked on by two child
+// processes while the series is written; both must end within QUENDELGetWaitPIDTimeout() seconds.
+// The run directory is then packed into an archive beside it, of the same name and ".tar.xz".
+//
+// When `sendToServer` is not 0 the server must be reachable before anything is gathered, the device
+// must have a serial number and a signed-in account, and the archive is posted to the server. When
+// it is 0 the server is not contacted.
+//
+// The collectors' settings files change only after the archive was made and, when asked, accepted
+// by the server. A run that ends earlier leaves them as they were, and the next run gathers the
+// same again. Neither a log or a collector that could not be read or run nor a performance file
+// that could not be written fails the run.
+//
+// When `removeAfter` is not 0 the run directory and the archive are gone when the function returns,
+// whatever it returns. When it is 0 both stay, and are the caller's to remove.
+//
+// Call this in a worker process that does nothing else and leads a session of its own (fork, then
+// setsid), and take the result from its exit status:
+//  * it reaps whichever child of the process ends, and a foreign one that ends meanwhile fails the
+//    run;
+//  * a run that fails before both of its children were started sends SIGTERM to the whole process
+//    group of the caller, the caller included;
+//  * it fails when the process ignores SIGCHLD;
+//  * a child that does not end after SIGTERM keeps it from returning.
+// One run at a time on a device: runs share the files in which they note what they collected.
+//
+// Returns 0 when the archive was made and, if asked, accepted, and both kinds of collectors'
+// settings were brought up to date; else -1.
+QUENDEL_EXPORT int QUENDELStartCollect(int removeAfter, int sendToServer,
+                                       const Json::Value& perfSeries);
+
+// How long a collection run waits for its children, in seconds: key "quendel_wait_collect_timeout"
+// of
+// "/etc.defaults/arvoinfo.conf", of which the first seven characters count, read as a decimal
+// number. 600 when the key is missing or the number is less than 1.
+//
+// The file is read at the first call only. What that read gave stays for the life of the process.
+//
+// Returns the limit, at least 1; never fails.
+QUENDEL_EXPORT int QUENDELGetWaitPIDTimeout();
+
+// Asks the device's local performance service for its current figures.
+//
+// `reply` receives the service's whole answer, also one that reports a failure; when the service
+// cannot be asked it is as the service's client left it. A series for QUENDELParsePerfJson() holds
+// such answers, each as {"success": true, "perf_data": reply}.
+//
+// Returns 0 when the answer has "success" true and a member "data", else -1.
+QUENDEL_EXPORT int QUENDELCollectPerf(Json::Value& reply);
+
+// Writes a series of performance samples as one file per category into `dir`, which must exist:
+// "quendel.perf.iSCSI", "quendel.perf.System", "quendel.perf.DiskIO", "quendel.perf.SpaceIO",
+// "quendel.perf.Network" and "quendel.perf.Memory". A file of that name is replaced.
+//
+// `series` is an object with the samples "perf_0", "perf_1" and so on, without a gap: what follows
+// one is ignored. A sample counts when its "success" is true, and holds its time under "perf_data",
+// "data", "time" and each category's figures beside that, under the category's name; any kind of
+// JSON value will do. A file holds a JSON array of {"time", "data"} in the order of the samples, or
+// null when no sample has figures for its category. A sample without a time is left out of every
+// file, a sample without figures for a category out of that file; both are logged and are no
+// failure.
+//
+// Returns 0 when all six files were written, else -1; one that fails does not stop the others.
+QUENDEL_EXPORT int QUENDELParsePerfJson(const char* dir, const Json::Value& series);
+
+// Packs a directory into `archive`, a tar file compressed with xz, as one top-level entry: the last
+// component of `dir`, which ends without a "/". An archive that exists is replaced.
+//
+// Needs the system's "/bin/tar" and xz.
+//
+// Returns 0, or -1 when tar could not be run or failed; the archive may then be there, incomplete.
+QUENDEL_EXPORT int QUENDELTarCollectData(const char* dir, const char* archive);
+
+// Posts an archive to the server, with its description: file name, device time zone, operating
+// system version, and `timestamp`, the start of the run in seconds since the epoch, as a number and
+// as local time.
+//
+// Needs a signed-in cloud account and a serial number. When the time zone or the version cannot be
+// read, the archive is posted without a description.
+//
+// Returns 0 when the server accepted the archive, else -1.
+QUENDEL_EXPORT int QUENDELSendCollectData(const char* archive, long timestamp);
 
 // The shared-memory channel hands one block of bytes from one process to another, through a System
 // V segment whose key and size in bytes both sides agree on. One process creates the segment; then,
