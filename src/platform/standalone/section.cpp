@@ -77,6 +77,12 @@ void CloseSection(SectionIndex& index, const OpenSection& section, size_t end) {
   ranges.push_back({section.begin, end});
 }
 
+// Where a crash cut a line short it hurt the section that the line belongs to, and that is not the
+// one above when the line is a comment: each section's comments stand in front of it.
+bool IsComment(std::string_view line) {
+  return !line.empty() && line.front() == '#';
+}
+
 // What is in front of the first section belongs to none.
 void IndexSections(SectionIndex& index) {
   OpenSection section = {};
@@ -85,16 +91,18 @@ void IndexSections(SectionIndex& index) {
   Line line;
   WrittenPair pair;
   std::string_view name;
+  bool isBelowComment = false;
   while (lines.Next(line)) {
     if (ParseSectionName(line.text, name)) {
       CloseSection(index, section, line.begin);
       section = {name, line.end, promised, 0, true};
     }
     section.pairs += ParsePair(line.text, pair) ? 1 : 0;
-    if (!line.complete || line.text == kCutComment) {
-      section.whole = false;
-    }
+    const bool isCut =
+        line.complete ? line.text == kCutComment && !isBelowComment : !IsComment(line.text);
+    section.whole = section.whole && !isCut;
     promised = PromisedPairs(line.text);
+    isBelowComment = IsComment(line.text);
   }
   CloseSection(index, section, index.text.size());
 }
