@@ -77,10 +77,10 @@ void CloseSection(SectionIndex& index, const OpenSection& section, size_t end) {
   ranges.push_back({section.begin, end});
 }
 
-// Where a crash cut a line short it hurt the section that the line belongs to, and that is not the
-// one above when the line is a comment: each section's comments stand in front of it.
-bool IsComment(std::string_view line) {
-  return !line.empty() && line.front() == '#';
+// Tells whether a line belongs to a section that begins, its count or its name: cut short, it does
+// not hurt the section above.
+bool IsLead(std::string_view line) {
+  return !line.empty() && (line.front() == '#' || line.front() == '[');
 }
 
 // What is in front of the first section belongs to none.
@@ -91,18 +91,18 @@ void IndexSections(SectionIndex& index) {
   Line line;
   WrittenPair pair;
   std::string_view name;
-  bool isBelowComment = false;
+  bool isBelowLead = false;
   while (lines.Next(line)) {
     if (ParseSectionName(line.text, name)) {
       CloseSection(index, section, line.begin);
-      section = {name, line.end, promised, 0, true};
+      section = {name, line.end, promised, 0, line.complete};
     }
     section.pairs += ParsePair(line.text, pair) ? 1 : 0;
     const bool isCut =
-        line.complete ? line.text == kCutComment && !isBelowComment : !IsComment(line.text);
+        line.complete ? line.text == kCutComment && !isBelowLead : !IsLead(line.text);
     section.whole = section.whole && !isCut;
     promised = PromisedPairs(line.text);
-    isBelowComment = IsComment(line.text);
+    isBelowLead = IsLead(line.text);
   }
   CloseSection(index, section, index.text.size());
 }
