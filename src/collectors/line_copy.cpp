@@ -132,11 +132,11 @@ int64_t CopyBytes(int source, int64_t begin, int64_t end, int sink) {
   ssize_t moved = 0;
   for (const Move move : {MoveByRange, MoveBySendfile, MoveByHand}) {
     do {
-      moved = move(source, offset, std::min(end - offset, kMostMovedBytes), sink);
-    } while ((moved > 0 && offset < end) || (moved < 0 && errno == EINTR));
-    if (offset == end) {
-      break;
-    }
+      if (offset == end) {
+        return end - begin;
+      }
+      moved = move(source, offset, std::min<int64_t>(end - offset, kMostMovedBytes), sink);
+    } while (moved > 0 || (moved < 0 && errno == EINTR));
   }
   return moved < 0 ? -1 : offset - begin;
 }
