@@ -1,4 +1,7 @@
 // The appliance's own operations, which a test can make fail.
+#include <array>
+#include <cstdarg>
+
 #include "platform/account.h"
 #include "platform/device.h"
 #include "platform/error.h"
@@ -6,6 +9,8 @@
 #include "platform/hash.h"
 #include "platform/key_value.h"
 #include "platform/list.h"
+#include "platform/process.h"
+#include "support/require.h"
 #include "support/wrap.h"
 
 QUENDEL_WRAP(int, ARVOMYHUBAccountGet, (void* record), record);
@@ -40,3 +45,85 @@ QUENDEL_WRAP(int, ALIBCSzListPush, (ALIBSZLIST * *list, const char* text), list,
 QUENDEL_WRAP(int, ALIBCSzListFind, (const ALIBSZLIST* list, const char* text), list, text);
 QUENDEL_WRAP(int, ALIBCSzListSize, (const ALIBSZLIST* list), list);
 QUENDEL_WRAP(const char*, ALIBCSzListGet, (const ALIBSZLIST* list, int index), list, index);
+
+QUENDEL_WRAP(int, ALIBCStrTok, (const char* text, const char* separators, ALIBSZLIST** list), text,
+             separators, list);
+
+QUENDEL_WRAP(int, ALIBCFileAddSection,
+             (const char* path, const char* section, ALIBSZHASH* hash, int flags), path, section,
+             hash, flags);
+QUENDEL_WRAP(int, ALIBCFileEnumSection, (const char* path, ALIBSZLIST** sections), path, sections);
+QUENDEL_WRAP(int, ALIBCFileGetSection, (const char* path, const char* section, ALIBSZHASH** hash),
+             path, section, hash);
+
+QUENDEL_WRAP(int, ALIBCFileEnumDir,
+             (const char* dir, const char* prefix, ALIBSZLIST** names, int flags), dir, prefix,
+             names, flags);
+QUENDEL_WRAP(int, ALIBCFileStat, (const char* path, int flags, struct stat* status), path, flags,
+             status);
+QUENDEL_WRAP(int, ALIBCFileTouch, (const char* path), path);
+QUENDEL_WRAP(int, ALIBCopyRemoveDir, (const char* path), path);
+QUENDEL_WRAP(int, ARVOFileCopy, (const char* src, const char* dst, const void* options), src, dst,
+             options);
+
+QUENDEL_WRAP(int, ALIBCProcForkEx, (int flags), flags);
+QUENDEL_WRAP(int, ALIBCPclose, (FILE * stream), stream);
+
+namespace {
+
+constexpr size_t kMostArguments = 8;
+
+// A program and its arguments, up to the null one that ends them; recorded like a list of texts.
+using CommandLine = std::array<const char*, kMostArguments + 2>;
+
+// Takes the texts that follow the program. The rest stays null.
+CommandLine TakeCommandLine(const char* program, va_list arguments) {
+  CommandLine line = {program};
+  size_t count = 1;
+  while (const char* argument = va_arg(arguments, const char*)) {
+    quendel::test::Require(count <= kMostArguments, "a program with more arguments than expected");
+    line[count++] = argument;
+  }
+  return line;
+}
+
+}  // namespace
+
+extern "C" {
+
+QUENDEL_WRAP_BY_HAND(ALIBCExec);
+int __real_ALIBCExec(const char* program, const char* a1, const char* a2, const char* a3,
+                     const char* a4);
+int __wrap_ALIBCExec(const char* program, const char* a1, const char* a2, const char* a3,
+                     const char* a4) {
+  const CommandLine line = {program, a1, a2, a3, a4};
+  const quendel::test::WrappedCall call("ALIBCExec", line.data());
+  return call.fails() ? call.result<int>() : __real_ALIBCExec(program, a1, a2, a3, a4);
+}
+
+QUENDEL_WRAP_BY_HAND(ALIBCExecl);
+int __real_ALIBCExecl(const char* program, int flags, ...);
+int __wrap_ALIBCExecl(const char* program, int flags, ...) {
+  va_list arguments;
+  va_start(arguments, flags);
+  const CommandLine line = TakeCommandLine(program, arguments);
+  va_end(arguments);
+  const quendel::test::WrappedCall call("ALIBCExecl", line.data());
+  return call.fails() ? call.result<int>()
+                      : __real_ALIBCExecl(program, flags, line[1], line[2], line[3], line[4],
+                                          line[5], line[6], line[7], line[8], line[9]);
+}
+
+QUENDEL_WRAP_BY_HAND(ALIBCPopen);
+FILE* __real_ALIBCPopen(const char* program, const char* mode, ...);
+FILE* __wrap_ALIBCPopen(const char* program, const char* mode, ...) {
+  va_list arguments;
+  va_start(arguments, mode);
+  const CommandLine line = TakeCommandLine(program, arguments);
+  va_end(arguments);
+  const quendel::test::WrappedCall call("ALIBCPopen", line.data());
+  return call.fails() ? call.result<FILE*>()
+                      : __real_ALIBCPopen(program, mode, line[1], line[2], line[3], line[4],
+                                          line[5], line[6], line[7], line[8], line[9]);
+}
+}
