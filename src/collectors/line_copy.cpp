@@ -19,14 +19,22 @@ constexpr size_t kBlockBytes = 64 << 10;
 // The most that one call to the kernel is asked to move.
 constexpr int64_t kMostMovedBytes = 1 << 30;
 
-// Reads up to `count` bytes at an offset. Returns how many there were, 0 at the end of the file,
-// negative on failure.
-ssize_t ReadAt(int file, void* buffer, int64_t count, int64_t offset) {
-  ssize_t got = 0;
-  do {
-    got = pread(file, buffer, static_cast<size_t>(count), offset);
-  } while (got < 0 && errno == EINTR);
-  return got;
+// Reads `count` bytes at an offset, or those up to the end of the file. Returns how many there
+// were, negative on failure.
+ssize_t ReadAt(int file, char* buffer, int64_t count, int64_t offset) {
+  ssize_t done = 0;
+  while (done < count) {
+    const ssize_t got =
+        pread(file, buffer + done, static_cast<size_t>(count - done), offset + done);
+    if (got == 0) {
+      break;
+    }
+    if (got < 0 && errno != EINTR) {
+      return -1;
+    }
+    done += std::max<ssize_t>(got, 0);
+  }
+  return done;
 }
 
 bool WriteAll(int file, const char* bytes, size_t count) {

@@ -8,6 +8,7 @@
 #include <functional>
 #include <sstream>
 
+#include "model/collector_files.h"
 #include "model/xz.h"
 #include "quendel.h"
 #include "support/appliance.h"
@@ -18,34 +19,6 @@ namespace quendel::test {
 namespace {
 
 namespace fs = std::filesystem;
-
-constexpr char kConfFolder[] = "/usr/arvo/etc/quendel";
-constexpr char kUpdateFile[] = "/tmp/quendel/quendel.log.update.conf";
-constexpr char kRunFolder[] = "/tmp/quendel_run/log";
-
-using Sections = std::vector<std::pair<std::string, ModelState>>;
-
-// Reads "key=value" lines and "[section]" lines; what stands before the first section has the name
-// "".
-Sections ReadPairs(const std::string& path) {
-  Sections sections = {{"", {}}};
-  std::istringstream in(Exists(path) ? ReadFile(path) : "");
-  for (std::string line; std::getline(in, line);) {
-    const size_t equals = line.find('=');
-    if (line.front() == '[') {
-      sections.emplace_back(line.substr(1, line.size() - 2), ModelState());
-    } else if (equals != std::string::npos) {
-      sections.back().second[line.substr(0, equals)] = line.substr(equals + 1);
-    }
-  }
-  return sections;
-}
-
-Sections ReadStaged() {
-  Sections sections = ReadPairs(kUpdateFile);
-  sections.erase(sections.begin());
-  return sections;
-}
 
 std::string Show(const std::string& text) {
   std::ostringstream out;
@@ -148,7 +121,7 @@ ModelConfs ReadConfs() {
   ModelConfs confs;
   for (const fs::directory_entry& entry : fs::directory_iterator(kConfFolder)) {
     if (entry.path().filename().string().rfind("quendel.log.", 0) == 0) {
-      confs[entry.path()] = ReadPairs(entry.path()).front().second;
+      confs[entry.path()] = ReadPairs(entry.path());
     }
   }
   return confs;
@@ -158,7 +131,7 @@ CheckedRun CollectAndCompare(const std::vector<std::string>& folders, const Mode
   fs::remove_all(kRunFolder);
   fs::create_directories(kRunFolder);
   fs::create_directories("/tmp/quendel");
-  fs::remove(kUpdateFile);  // as the driver does before it starts the collectors
+  fs::remove(kLogUpdateFile);  // as the driver does before it starts the collectors
   const ModelDisk before = ReadDisk(folders);
   const ModelConfs confs = ReadConfs();
   ClearLog();
@@ -210,7 +183,7 @@ std::string CommitAndCompare(int failing) {
     FailCall("ALIBCFileSetKeyValue", failing, -1);
     FailCall("ALIBCErrGet", 0, 77);
   }
-  const int result = QUENDELUpdateCollectConf(kUpdateFile);
+  const int result = QUENDELUpdateCollectConf(kLogUpdateFile);
   ResetCalls();
 
   ModelConfs actual = ReadConfs();

@@ -9,9 +9,11 @@
 
 #include <filesystem>
 #include <random>
+#include <regex>
 #include <set>
 
 #include "model/checked_run.h"
+#include "model/collector_files.h"
 #include "model/xz.h"
 #include "quendel.h"
 #include "support/appliance.h"
@@ -22,12 +24,8 @@ namespace {
 
 namespace fs = std::filesystem;
 
-constexpr char kConfFolder[] = "/usr/arvo/etc/quendel";
-
 // Every other history has its logs on the file system that they are collected to.
 constexpr const char* kFileSystems[] = {"/volume1", "/tmp"};
-constexpr char kFreshState[] =
-    "last_hash=\"\"\ntar_log_inode=\"\"\nlast_byte=\"\"\ntotal_byte=\"\"\ninode=\"\"\n";
 
 int Environment(const char* name, int otherwise) {
   const char* value = getenv(name);
@@ -88,12 +86,14 @@ class History {
     // Two logs of one name share their files; that costs lines, so only where anything may happen.
     const bool sharesName = kind_ == Kind::kAnything && OneIn(8);
     Log log;
-    log.conf = std::string(kConfFolder) + "/quendel.log." + digit;
     log.folder = logRoot_ + "/" + digit;
     log.path = log.folder + "/messages";
     fs::create_directories(log.folder);
-    WriteFile(log.conf, "name=" + std::string(sharesName ? "same" : "log" + digit) +
-                            "\npath=" + log.path + "\n" + kFreshState);
+    log.conf = InstallLog("log" + digit, log.path);
+    if (sharesName) {
+      WriteFile(log.conf,
+                std::regex_replace(ReadFile(log.conf), std::regex("name=.*"), "name=same"));
+    }
     logs_.push_back(log);
     folders_.push_back(log.folder);
     if (!OneIn(4)) {
@@ -126,9 +126,7 @@ class History {
     close(file);
   }
 
-  std::string Archive(const Log& log, int n) const {
-    return log.path + "." + std::to_string(n) + ".xz";
-  }
+  static std::string Archive(const Log& log, int n) { return ArchiveOf(log.path, n); }
 
   // A line that no other history has, or, where anything may happen, one of a few.
   std::string NewText() {
@@ -368,14 +366,16 @@ void PlayHistories(int first, int count, Kind kind) {
 
 }  // namespace
 
-TEST(LogHistoryTest, FollowsTheModelWhateverHappens) {
-  PlayHistories(1, 2000, Kind::kAnything);
+class LogHistoryTest : public testing::TestWithParam<int> {};
+class WellRotatedLogHistoryTest : public testing::TestWithParam<int> {};
+
+TEST_P(LogHistoryTest, FollowsTheModel) {
+  PlayHistories(1 + 1000 * GetParam(), 1000, Kind::kAnything);
 }
 
-TEST(LogHistoryTest, FollowsTheModelWhateverHappensAgain) {
-  PlayHistories(2001, 2000, Kind::kAnything);
+TEST_P(WellRotatedLogHistoryTest, FollowsTheModelAndLosesNoLine) {
+  PlayHistories(100001 + 500 * GetParam(), 500, Kind::kWellRotated);
 }
 
-TEST(LogHistoryTest, LosesNoLineOfLogsThatAreRotatedWell) {
-  PlayHistories(100001, 1500, Kind::kWellRotated);
-}
+INSTANTIATE_TEST_SUITE_P(Thousand, LogHistoryTest, testing::Range(0, 4));
+INSTANTIATE_TEST_SUITE_P(FiveHundred, WellRotatedLogHistoryTest, testing::Range(0, 3));

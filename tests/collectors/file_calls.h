@@ -1,0 +1,33 @@
+// The system calls that move a log's bytes, as a test wants them to answer.
+//
+// A test program that links file_calls.cpp has these calls pass through the hooks below, which are
+// empty at first: then the real call is made.
+#ifndef TESTS_COLLECTORS_FILE_CALLS_H_
+#define TESTS_COLLECTORS_FILE_CALLS_H_
+
+#include <sys/stat.h>
+#include <sys/types.h>
+
+#include <functional>
+
+namespace quendel::test {
+
+struct FileCalls {
+  // Each may do something first, and change the number of bytes that are asked for. When it returns
+  // false the call fails, with the errno that the hook has set.
+  std::function<bool(size_t& count)> copy_file_range;
+  std::function<bool(size_t& count)> sendfile;
+  std::function<bool(size_t& count)> pread;
+  std::function<bool(size_t& count)> write;
+  // Changes what stat() has told of a path.
+  std::function<void(const char* path, struct stat& status)> stat;
+};
+
+FileCalls& OnFileCalls();
+
+// A hook for a call that always fails with this errno.
+std::function<bool(size_t&)> FailsWith(int error);
+
+}  // namespace quendel::test
+
+#endif  // TESTS_COLLECTORS_FILE_CALLS_H_

@@ -1,0 +1,375 @@
+// Reading and copying lines of any size in blocks.
+#include "collectors/line_copy.h"
+
+#include <fcntl.h>
+#include <gmock/gmock.h>
+#include <sys/stat.h>
+
+#include <cerrno>
+#include <filesystem>
+
+#include "collectors/file_calls.h"
+#include "quendel.h"
+#include "support/appliance.h"
+
+using namespace quendel;
+using namespace quendel::test;
+
+namespace {
+
+constexpr char kSource[] = "/volume1/source";
+constexpr char kSink[] = "/tmp/sink";
+
+// Around the size of a block, which is 65536 bytes.
+constexpr size_t kLengths[] = {0, 1, 2, 65534, 65535, 65536, 65537, 131071, 131072, 131073, 200000};
+
+std::string Md5(const std::string& text) {
+  char digits[33];
+  QUENDELMD5String(text, digits);
+  return digits;
+}
+
+std::string LineOf(size_t length) {
+  std::string line;
+  while (line.size() < length) {
+    line += static_cast<char>('a' + line.size() % 26);
+  }
+  return line;
+}
+
+OwnedFd Source(const std::string& text) {
+  WriteFile(kSource, text);
+  int64_t size = -1;
+  OwnedFd file = OpenRegularFile(kSource, size);
+  EXPECT_EQ(size, static_cast<int64_t>(text.size()));
+  return file;
+}
+
+OwnedFd Sink() {
+  return OwnedFd(open(kSink, O_RDWR | O_CREAT | O_TRUNC, 0600));
+}
+
+void ExpectLine(const LineMark& line, const std::string& text, size_t end) {
+  EXPECT_EQ(line.hash, Md5(text));
+  EXPECT_EQ(line.length, static_cast<int64_t>(text.size()));
+  EXPECT_EQ(line.end, static_cast<int64_t>(end));
+}
+
+// Copies and returns what has arrived; `taken` receives the number of bytes taken.
+std::string Copy(const std::string& text, int64_t start, int64_t limit, int64_t& taken) {
+  const OwnedFd source = Source(text);
+  const OwnedFd sink = Sink();
+  taken = CopyLines(source.get(), start, limit, sink.get());
+  return ReadFile(kSink);
+}
+
+// What CopyLines() has to deliver, told line by line.
+std::string CopyByLines(const std::string& text, size_t position, size_t limit, int64_t& taken) {
+  const size_t start = position;
+  std::string out;
+  while (position < text.size() && (position == start || position < limit)) {
+    const size_t newline = text.find('\n', position);
+    out += text.substr(position, newline - position) + "\n";
+    position = newline == std::string::npos ? text.size() : newline + 1;
+  }
+  taken = static_cast<int64_t>(position - start);
+  return out;
+}
+
+bool OpensAsRegular(const char* path) {
+  int64_t size = 0;
+  return static_cast<bool>(OpenRegularFile(path, size));
+}
+
+}  // namespace
+
+TEST(OpenRegularFileTest, OpensARegularFileAndTellsItsSize) {
+  WriteFile(kSource, "12345");
+  int64_t size = 0;
+  EXPECT_TRUE(OpenRegularFile(kSource, size));
+  EXPECT_EQ(size, 5);
+}
+
+TEST(OpenRegularFileTest, FollowsALink) {
+  WriteFile(kSource, "12345");
+  std::filesystem::create_symlink(kSource, "/tmp/link");
+  EXPECT_TRUE(OpensAsRegular("/tmp/link"));
+}
+
+TEST(OpenRegularFileTest, RefusesEverythingElseAtOnce) {
+  ASSERT_EQ(mkfifo("/tmp/fifo", 0600), 0);
+  EXPECT_FALSE(OpensAsRegular("/tmp/fifo"));
+  EXPECT_FALSE(OpensAsRegular("/tmp"));
+  EXPECT_FALSE(OpensAsRegular("/dev/zero"));
+  EXPECT_FALSE(OpensAsRegular("/tmp/missing"));
+}
+
+TEST(OpenRegularFileTest, KeepsTheDescriptorFromPrograms) {
+  const OwnedFd file = Source("");
+  EXPECT_NE(fcntl(file.get(), F_GETFD) & FD_CLOEXEC, 0);
+}
+
+TEST(ReadLineTest, ReadsALineOfAnyLength) {
+  for (const size_t length : kLengths) {
+    const OwnedFd file = Source("ab\n" + LineOf(length) + "\nnext");
+    LineMark line;
+    ASSERT_EQ(ReadLine(file.get(), 3, line), ReadResult::kLine);
+    ExpectLine(line, LineOf(length), 3 + length + 1);
+  }
+}
+
+TEST(ReadLineTest, ReadsALastLineWithoutNewline) {
+  for (const size_t length : kLengths) {
+    const OwnedFd file = Source("ab\n" + LineOf(length));
+    LineMark line;
+    if (length == 0) {
+      EXPECT_EQ(ReadLine(file.get(), 3, line), ReadResult::kNoLine);
+      continue;
+    }
+    ASSERT_EQ(ReadLine(file.get(), 3, line), ReadResult::kLine);
+    ExpectLine(line, LineOf(length), 3 + length);
+  }
+}
+
+TEST(ReadLineTest, TakesEveryByteButTheNewline) {
+  std::string text;
+  for (int byte = 0; byte < 256; ++byte) {
+    text += byte == '\n' ? "" : std::string(1, static_cast<char>(byte));
+  }
+  const OwnedFd file = Source(text + "\n");
+  LineMark line;
+  ASSERT_EQ(ReadLine(file.get(), 0, line), ReadResult::kLine);
+  ExpectLine(line, text, 256);
+}
+
+TEST(ReadLineTest, FindsNoLineAtOrBehindTheEnd) {
+  const OwnedFd file = Source("ab\n");
+  LineMark line;
+  EXPECT_EQ(ReadLine(file.get(), 3, line), ReadResult::kNoLine);
+  EXPECT_EQ(ReadLine(file.get(), 4, line), ReadResult::kNoLine);
+}
+
+TEST(ReadLineTest, TellsAnErrorFromTheEnd) {
+  const OwnedFd file = Source("ab\n");
+  OnFileCalls().pread = FailsWith(EIO);
+  LineMark line;
+  EXPECT_EQ(ReadLine(file.get(), 0, line), ReadResult::kError);
+}
+
+TEST(ReadLineTest, ReadsOnAfterAnInterruptionAndAShortRead) {
+  const OwnedFd file = Source(LineOf(100) + "\n");
+  int calls = 0;
+  OnFileCalls().pread = [&](size_t& count) {
+    count = 7;
+    errno = EINTR;
+    return ++calls % 2 == 0;
+  };
+  LineMark line;
+  ASSERT_EQ(ReadLine(file.get(), 0, line), ReadResult::kLine);
+  ExpectLine(line, LineOf(100), 101);
+}
+
+TEST(ReadLastLineTest, FindsALineOfAnyLengthFromTheEnd) {
+  for (const size_t length : kLengths) {
+    for (const size_t before : kLengths) {
+      const OwnedFd file = Source(LineOf(before) + "\n" + LineOf(length) + "\n");
+      LineMark line;
+      ASSERT_EQ(ReadLastLine(file.get(), line), ReadResult::kLine);
+      ExpectLine(line, LineOf(length), before + length + 2);
+    }
+  }
+}
+
+TEST(ReadLastLineTest, FindsALastLineWithoutNewline) {
+  for (const size_t length : kLengths) {
+    const OwnedFd file = Source("first\n" + LineOf(length));
+    LineMark line;
+    ASSERT_EQ(ReadLastLine(file.get(), line), ReadResult::kLine);
+    ExpectLine(line, length == 0 ? "first" : LineOf(length), 6 + length);
+  }
+}
+
+TEST(ReadLastLineTest, TakesTheOnlyLine) {
+  LineMark line;
+  ASSERT_EQ(ReadLastLine(Source("only").get(), line), ReadResult::kLine);
+  ExpectLine(line, "only", 4);
+  ASSERT_EQ(ReadLastLine(Source("\n").get(), line), ReadResult::kLine);
+  ExpectLine(line, "", 1);
+}
+
+TEST(ReadLastLineTest, FindsNoLineInAnEmptyFile) {
+  LineMark line;
+  EXPECT_EQ(ReadLastLine(Source("").get(), line), ReadResult::kNoLine);
+}
+
+TEST(ReadLastLineTest, FailsWhenTheFileCannotBeRead) {
+  const OwnedFd file = Source("a\nb\n");
+  int calls = 0;
+  for (const int failing : {1, 2, 3}) {
+    calls = 0;
+    OnFileCalls().pread = [&](size_t&) {
+      errno = EIO;
+      return ++calls != failing;
+    };
+    LineMark line;
+    EXPECT_EQ(ReadLastLine(file.get(), line), ReadResult::kError) << failing;
+  }
+  EXPECT_EQ(calls, 3);
+}
+
+TEST(CopyLinesTest, CopiesLineByLineAsFarAsTheLimit) {
+  const std::string texts[] = {"a\nbb\n\n\nccc\nd", "\n\n\n", "no newline at all",
+                               LineOf(65536) + "\n" + LineOf(65535) + "\nend\n",
+                               LineOf(200000) + "\n" + LineOf(3)};
+  int cases = 0;
+  for (const std::string& text : texts) {
+    const size_t step = text.size() < 100 ? 1 : 13107;
+    for (size_t start = 0; start <= text.size(); start += step) {
+      for (size_t limit = 0; limit <= text.size() + step; limit += step) {
+        int64_t taken = -1;
+        int64_t expected = -1;
+        ASSERT_EQ(Copy(text, static_cast<int64_t>(start), static_cast<int64_t>(limit), taken),
+                  CopyByLines(text, start, limit, expected))
+            << start << " to " << limit << " of " << text.substr(0, 30);
+        ASSERT_EQ(taken, expected);
+        ++cases;
+      }
+    }
+  }
+  EXPECT_GT(cases, 500);
+}
+
+TEST(CopyLinesTest, CopiesALineThatBeginsBelowTheLimitToItsEnd) {
+  int64_t taken = 0;
+  EXPECT_EQ(Copy("one\ntwo\nthree\n", 0, 5, taken), "one\ntwo\n");
+  EXPECT_EQ(taken, 8);
+  EXPECT_EQ(Copy("one\ntwo\nthree\n", 0, 4, taken), "one\n");
+}
+
+TEST(CopyLinesTest, TakesOneLineThatLiesBehindTheLimit) {
+  int64_t taken = 0;
+  EXPECT_EQ(Copy("one\ntwo\nthree\n", 4, 2, taken), "two\n");
+}
+
+TEST(CopyLinesTest, CopiesByWhicheverWayTheFileSystemsAllow) {
+  const std::string text = LineOf(150000) + "\n" + LineOf(10) + "\n";
+  const auto never = FailsWith(EXDEV);
+  const auto notHere = FailsWith(EINVAL);
+  for (const auto& range : {std::function<bool(size_t&)>(), never}) {
+    for (const auto& send : {std::function<bool(size_t&)>(), notHere}) {
+      OnFileCalls().copy_file_range = range;
+      OnFileCalls().sendfile = send;
+      int64_t taken = 0;
+      EXPECT_EQ(Copy(text, 0, static_cast<int64_t>(text.size()), taken), text);
+      EXPECT_EQ(taken, static_cast<int64_t>(text.size()));
+    }
+  }
+}
+
+TEST(CopyLinesTest, GoesOnWhereAWayOfCopyingStopped) {
+  const std::string text = LineOf(1000) + "\n";
+  const auto stopsAfterTwo = [calls = 0](size_t& count) mutable {
+    count = 100;
+    errno = EIO;
+    return ++calls <= 2;
+  };
+  OnFileCalls().copy_file_range = stopsAfterTwo;
+  OnFileCalls().sendfile = stopsAfterTwo;
+  WriteFile("/tmp/source", text);  // where a range can be copied
+  int64_t size = 0;
+  const OwnedFd source = OpenRegularFile("/tmp/source", size);
+  const OwnedFd sink = Sink();
+  EXPECT_EQ(CopyLines(source.get(), 0, size, sink.get()), size);
+  EXPECT_EQ(ReadFile(kSink), text);
+}
+
+TEST(CopyLinesTest, TriesAgainAfterAnInterruption) {
+  const std::string text = LineOf(1000) + "\n";
+  const auto interrupted = [calls = 0](size_t& count) mutable {
+    count = std::min<size_t>(count, 300);
+    errno = EINTR;
+    return ++calls % 2 == 0;
+  };
+  int sent = 0;
+  OnFileCalls().copy_file_range = FailsWith(EXDEV);
+  OnFileCalls().sendfile = [&](size_t& count) {
+    count = 300;
+    errno = EINTR;
+    return ++sent % 2 == 0;
+  };
+  int64_t taken = 0;
+  EXPECT_EQ(Copy(text, 0, 1001, taken), text);
+  EXPECT_GE(sent, 8);
+
+  OnFileCalls().sendfile = FailsWith(ENOSYS);
+  OnFileCalls().write = interrupted;
+  OnFileCalls().pread = interrupted;
+  EXPECT_EQ(Copy(text, 0, 1001, taken), text);
+}
+
+TEST(CopyLinesTest, FailsWhenNothingCanBeWritten) {
+  OnFileCalls().copy_file_range = FailsWith(ENOSPC);
+  OnFileCalls().sendfile = FailsWith(ENOSPC);
+  OnFileCalls().write = FailsWith(ENOSPC);
+  int64_t taken = 0;
+  Copy("one\ntwo\n", 0, 8, taken);
+  EXPECT_LT(taken, 0);
+}
+
+TEST(CopyLinesTest, FailsWhenTheAddedNewlineCannotBeWritten) {
+  OnFileCalls().write = FailsWith(ENOSPC);
+  int64_t taken = 0;
+  Copy("unfinished", 0, 10, taken);
+  EXPECT_LT(taken, 0);
+}
+
+TEST(CopyLinesTest, TellsAnErrorFromTheEnd) {
+  for (const int failing : {1, 2}) {
+    OnFileCalls().pread = [calls = 0, failing](size_t&) mutable {
+      errno = EIO;
+      return ++calls != failing;
+    };
+    int64_t taken = 0;
+    Copy("one\ntwo\n", 0, 8, taken);
+    EXPECT_LT(taken, 0) << failing;
+  }
+}
+
+TEST(CopyLinesTest, EndsWithTheSourceThatShrinksMeanwhile) {
+  const auto shrink = [](size_t&) {
+    std::filesystem::resize_file(kSource, 6);
+    errno = EXDEV;
+    return false;
+  };
+  OnFileCalls().copy_file_range = shrink;
+  int64_t taken = 0;
+  EXPECT_EQ(Copy("one\ntwo\nthree\n", 0, 14, taken), "one\ntw\n");
+  EXPECT_EQ(taken, 6);
+}
+
+TEST(CopyLinesTest, TakesNothingThatArrivesMeanwhile) {
+  OnFileCalls().copy_file_range = [](size_t&) {
+    WriteFile(kSource, "one\ntwo and more\n");
+    errno = EXDEV;
+    return false;
+  };
+  int64_t taken = 0;
+  EXPECT_EQ(Copy("one\ntwo", 0, 7, taken), "one\ntwo\n");
+  EXPECT_EQ(taken, 7);
+}
+
+TEST(CopyWholeTest, AddsAllOfTheSourceBehindWhatIsThere) {
+  const std::string text = LineOf(200000);
+  const OwnedFd source = Source(text);
+  const OwnedFd sink = Sink();
+  ASSERT_EQ(write(sink.get(), "before", 6), 6);
+  EXPECT_TRUE(CopyWhole(source.get(), sink.get()));
+  EXPECT_EQ(ReadFile(kSink), "before" + text);
+}
+
+TEST(CopyWholeTest, FailsWhenNothingCanBeWritten) {
+  OnFileCalls().copy_file_range = FailsWith(ENOSPC);
+  OnFileCalls().sendfile = FailsWith(ENOSPC);
+  OnFileCalls().write = FailsWith(ENOSPC);
+  EXPECT_FALSE(CopyWhole(Source("text").get(), Sink().get()));
+}

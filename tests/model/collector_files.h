@@ -1,0 +1,52 @@
+// The files around the log collector: its configuration, its state, the logs, and what a run
+// leaves.
+#ifndef TESTS_MODEL_COLLECTOR_FILES_H_
+#define TESTS_MODEL_COLLECTOR_FILES_H_
+
+#include <map>
+#include <string>
+#include <utility>
+#include <vector>
+
+namespace quendel::test {
+
+inline constexpr char kConfFolder[] = "/usr/arvo/etc/quendel";
+inline constexpr char kLogUpdateFile[] = "/tmp/quendel/quendel.log.update.conf";
+inline constexpr char kRunFolder[] = "/tmp/quendel_run/log";
+
+using Pairs = std::map<std::string, std::string>;
+using Sections = std::vector<std::pair<std::string, Pairs>>;
+
+// Installs a log collector that has collected nothing yet. Returns the path of its configuration
+// file, "/usr/arvo/etc/quendel/quendel.log." and the name.
+std::string InstallLog(const std::string& name, const std::string& path);
+
+// The pairs of a configuration file, and the sections of what the last run staged.
+Pairs ReadPairs(const std::string& path);
+Sections ReadStaged();
+
+void AppendFile(const std::string& path, const std::string& text);
+
+// Moves the log's archives up by one number, makes its text archive 1, and leaves the log as a new
+// empty file (Rotate) or as the old one, emptied (CopyTruncate).
+void Rotate(const std::string& log);
+void CopyTruncate(const std::string& log);
+
+// The path of a log's archive.
+std::string ArchiveOf(const std::string& log, int number);
+
+// Collects into an emptied run folder. Returns the collector's result.
+int Collect();
+
+// Commits what was staged, and expects no failure.
+void Commit();
+
+// Collects and commits, and expects no failure and nothing logged.
+void CollectAndCommit();
+
+// What the last run wrote: file names and texts, archives (".xz" at the end) decompressed.
+std::map<std::string, std::string> Delivered();
+
+}  // namespace quendel::test
+
+#endif  // TESTS_MODEL_COLLECTOR_FILES_H_
