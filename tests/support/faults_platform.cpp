@@ -10,6 +10,7 @@
 #include "platform/key_value.h"
 #include "platform/list.h"
 #include "platform/process.h"
+#include "platform/zone.h"
 #include "support/require.h"
 #include "support/wrap.h"
 
@@ -65,6 +66,9 @@ QUENDEL_WRAP(int, ALIBCFileTouch, (const char* path), path);
 QUENDEL_WRAP(int, ALIBCopyRemoveDir, (const char* path), path);
 QUENDEL_WRAP(int, ARVOFileCopy, (const char* src, const char* dst, const void* options), src, dst,
              options);
+
+QUENDEL_WRAP(int, ARVOZoneGet, (char* zone, int size, int* index), zone, size, index);
+QUENDEL_WRAP(int, ARVOZoneDesc, (const char* zone, char* desc, int size), zone, desc, size);
 
 QUENDEL_WRAP(int, ALIBCProcForkEx, (int flags), flags);
 QUENDEL_WRAP(int, ALIBCPclose, (FILE * stream), stream);
