@@ -1,0 +1,925 @@
+// The collection run: what it does, in which order, and what it leaves behind.
+#include <gmock/gmock.h>
+#include <sys/mount.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <csignal>
+#include <filesystem>
+#include <functional>
+#include <stdexcept>
+
+#include "base/paths.h"
+#include "collect/archive_entries.h"
+#include "collect/collection.h"
+#include "collect/collector_child.h"
+#include "quendel.h"
+#include "support/appliance.h"
+#include "support/faults.h"
+#include "support/json.h"
+#include "support/log.h"
+
+using namespace quendel::test;
+using testing::_;
+using testing::Contains;
+using testing::Each;
+using testing::ElementsAre;
+using testing::HasSubstr;
+using testing::IsEmpty;
+using testing::MatchesRegex;
+using testing::Not;
+using testing::SizeIs;
+using testing::StartsWith;
+using testing::UnorderedElementsAre;
+
+namespace {
+
+constexpr char kUnit[] = "quendel_start_collect";
+
+// What a run's clean-up logs in a caller that SIGTERM does not end, when neither child was started.
+testing::Matcher<LogLine> NothingToWaitFor(const std::string& kind) {
+  return Logged(kUnit, "Failed to wait a child for " + kind + ", err=No child processes");
+}
+
+// Runs a collection that is not sent. Its children get the time they need.
+int Collect(int removeAfter = 0) {
+  OnSleep(AwaitAnyChild);
+  return QUENDELStartCollect(removeAfter, 0, PerfSeries());
+}
+
+void WaitLimit(const std::string& seconds) {
+  WriteFile("/etc.defaults/arvoinfo.conf",
+            "quendel_server=support.test\nquendel_wait_collect_timeout=" + seconds + "\n");
+}
+
+// Everything in /tmp that a run makes.
+std::vector<std::string> LeftInTmp() {
+  std::vector<std::string> left;
+  for (const auto& entry : std::filesystem::directory_iterator("/tmp")) {
+    const std::string name = entry.path().filename();
+    if (name.compare(0, 7, "quendel") == 0) {
+      left.push_back(name);
+    }
+  }
+  std::sort(left.begin(), left.end());
+  return left;
+}
+
+std::vector<std::string> LeftInWorkRoot() {
+  std::vector<std::string> left;
+  for (const auto& entry : std::filesystem::directory_iterator(quendel::kWorkRoot)) {
+    left.push_back(entry.path().filename());
+  }
+  std::sort(left.begin(), left.end());
+  return left;
+}
+
+mode_t ModeOf(const char* path) {
+  struct stat status = {};
+  EXPECT_EQ(stat(path, &status), 0) << path;
+  return status.st_mode;
+}
+
+// Runs what fails before both children were started, in a process that lives on after SIGTERM.
+Ending RunIgnoringSigterm(const std::function<int()>& run) {
+  return InAGroupOfItsOwn([&] {
+    signal(SIGTERM, SIG_IGN);
+    return run();
+  });
+}
+
+void ExpectCollected(const std::string& name) {
+  const auto entries = ArchiveEntries("/tmp/" + name + ".tar.xz");
+  EXPECT_EQ(entries.at(name + "/log/messages"), "first\nsecond\n");
+  EXPECT_EQ(JsonOf(entries.at(name + "/udc/udc.result")), JsonOf(R"({"raid":{"disks":4}})"));
+  EXPECT_EQ(JsonOf(entries.at(name + "/perf/quendel.perf.Memory")),
+            JsonOf(R"([{"time":1,"data":"Memory"}])"));
+  EXPECT_EQ(entries.size(), 4U + 1 + 1 + 6);
+}
+
+}  // namespace
+
+TEST(GetWaitPIDTimeoutTest, IsTenMinutesUnlessConfigured) {
+  EXPECT_EQ(QUENDELGetWaitPIDTimeout(), 600);
+}
+
+TEST(GetWaitPIDTimeoutTest, IsTenMinutesWithoutTheSettingsFile) {
+  RemoveFile("/etc.defaults/arvoinfo.conf");
+  EXPECT_EQ(QUENDELGetWaitPIDTimeout(), 600);
+}
+
+TEST(GetWaitPIDTimeoutTest, IsTheConfiguredNumber) {
+  WaitLimit("45");
+  EXPECT_EQ(QUENDELGetWaitPIDTimeout(), 45);
+}
+
+TEST(GetWaitPIDTimeoutTest, IsReadOncePerProcess) {
+  WaitLimit("45");
+  EXPECT_EQ(QUENDELGetWaitPIDTimeout(), 45);
+  WaitLimit("46");
+  EXPECT_EQ(QUENDELGetWaitPIDTimeout(), 45);
+  EXPECT_EQ(Calls("ALIBCFileGetKeyValue"), 1);
+}
+
+TEST(GetWaitPIDTimeoutTest, IsNotReadAgainAfterAFailedRead) {
+  RemoveFile("/etc.defaults/arvoinfo.conf");
+  EXPECT_EQ(QUENDELGetWaitPIDTimeout(), 600);
+  WaitLimit("45");
+  EXPECT_EQ(QUENDELGetWaitPIDTimeout(), 600);
+  EXPECT_EQ(Calls("ALIBCFileGetKeyValue"), 1);
+}
+
+// Every value is read in a process of its own, which is what keeps it.
+TEST(GetWaitPIDTimeoutTest, TakesTheDecimalNumberThatTheFirstSevenCharactersBeginWith) {
+  const std::vector<std::pair<std::string, int>> limits = {
+      {"1", 1},   {"0", 600},          {"-5", 600},           {"soon", 600}, {"", 600},
+      {"+7", 7},  {"12 minutes", 12},  {"12345678", 1234567}, {"3.9", 3},    {"0x10", 600},
+      {"007", 7}, {"0000000045", 600}, {"9999999", 9999999},
+  };
+  for (const auto& [text, seconds] : limits) {
+    WaitLimit(text);
+    EXPECT_EQ(InAGroupOfItsOwn([seconds = seconds] {
+                return QUENDELGetWaitPIDTimeout() == seconds ? 0 : -1;
+              }).result,
+              0)
+        << text;
+  }
+}
+
+TEST(StartCollectTest, LeavesAnArchiveOfWhatIsNew) {
+  StopTheClock();
+  InstallCollectors();
+  EXPECT_EQ(Collect(), 0);
+  ExpectCollected(kRunName);
+  EXPECT_THAT(LeftInTmp(), ElementsAre("quendel", kRunName, std::string(kRunName) + ".tar.xz"));
+  EXPECT_THAT(Log(), IsEmpty());
+}
+
+TEST(StartCollectTest, CommitsWhatItCollected) {
+  InstallCollectors();
+  EXPECT_EQ(Collect(1), 0);
+  EXPECT_THAT(ReadFile("/usr/arvo/etc/quendel/quendel.log.messages"), HasSubstr("total_byte=13\n"));
+  EXPECT_THAT(ReadFile("/usr/arvo/etc/quendel/quendel.udc.raid"), Not(HasSubstr("last_hash=\"\"")));
+}
+
+TEST(StartCollectTest, LeavesOutWhatAnEarlierRunCommitted) {
+  StopTheClock();
+  InstallCollectors();
+  ASSERT_EQ(Collect(), 0);
+  WriteFile("/volume1/messages", "first\nsecond\nthird\n");
+  ASSERT_EQ(Collect(), 0);
+  const std::string second = "quendel_20240305_070809_1";
+  const auto entries = ArchiveEntries("/tmp/" + second + ".tar.xz");
+  EXPECT_EQ(entries.at(second + "/log/messages"), "third\n");
+  EXPECT_EQ(JsonOf(entries.at(second + "/udc/udc.result")), JsonOf(R"({"raid":"Same"})"));
+}
+
+TEST(StartCollectTest, MakesItsDirectoriesForTheOwnerOnly) {
+  StopTheClock();
+  umask(0);
+  ASSERT_EQ(Collect(), 0);
+  for (const char* path : {"", "/udc", "/log", "/perf"}) {
+    EXPECT_EQ(ModeOf((kRunDir + std::string(path)).c_str()), S_IFDIR | 0700U) << path;
+  }
+  EXPECT_EQ(ModeOf(quendel::kWorkRoot), S_IFDIR | 0700U);
+}
+
+TEST(StartCollectTest, LeavesAWorkRootThatIsThereAsItIs) {
+  ASSERT_EQ(mkdir(quendel::kWorkRoot, 0750), 0);
+  Record("mkdir");
+  ASSERT_EQ(Collect(), 0);
+  EXPECT_EQ(ModeOf(quendel::kWorkRoot), S_IFDIR | 0750U);
+  EXPECT_THAT(Recorded(), SizeIs(4));
+}
+
+TEST(StartCollectTest, ReusesARunDirectoryThatIsThere) {
+  StopTheClock();
+  InstallCollectors();
+  WriteFile(std::string(kRunDir) + "/log/of-before", "1");
+  FailCall("ALIBCFileCheckDir", 2, 0);  // asked whether the name is taken
+  EXPECT_EQ(Collect(), 0);
+  const auto entries = ArchiveEntries(kArchive);
+  EXPECT_EQ(entries.at(std::string(kRunName) + "/log/of-before"), "1");
+  EXPECT_EQ(entries.at(std::string(kRunName) + "/log/messages"), "first\nsecond\n");
+}
+
+TEST(StartCollectTest, TakesTheNextNameWhenOneIsTaken) {
+  StopTheClock();
+  WriteFile(std::string(kRunDir) + "/of-someone", "1");
+  EXPECT_EQ(Collect(1), 0);
+  EXPECT_THAT(LeftInTmp(), ElementsAre("quendel", kRunName));
+}
+
+TEST(StartCollectTest, LeavesItToTheDirectoryWhetherTheNameIsFree) {
+  StopTheClock();
+  FailCall("ALIBCFileCheckDir", 2, -1);
+  EXPECT_EQ(Collect(), 0);
+  EXPECT_TRUE(Exists(kArchive));
+  EXPECT_THAT(Log(), IsEmpty());
+}
+
+TEST(StartCollectTest, RemovesTheRunDirectoryAndTheArchiveWhenAsked) {
+  InstallCollectors();
+  EXPECT_EQ(Collect(1), 0);
+  EXPECT_THAT(LeftInTmp(), ElementsAre("quendel"));
+  EXPECT_THAT(LeftInWorkRoot(), ElementsAre("quendel.log.update.conf", "quendel.udc.update.conf"));
+}
+
+TEST(StartCollectTest, TakesAnyNonZeroNumberForYes) {
+  StopTheClock();
+  EXPECT_EQ(Collect(-1), 0);
+  EXPECT_THAT(LeftInTmp(), ElementsAre("quendel"));
+}
+
+TEST(StartCollectTest, ForksTheUdcChildAndThenTheLogChild) {
+  Record("ALIBCProcForkEx");
+  OnSleep([] { EXPECT_LT(ChildOf("udc"), ChildOf("log")); });
+  ReplaceCollector("udc", Hang);
+  ReplaceCollector("log", Hang);
+  WaitLimit("1");
+  EXPECT_EQ(QUENDELStartCollect(1, 0, PerfSeries()), -1);
+  EXPECT_THAT(Recorded(), ElementsAre("187", "187"));
+}
+
+TEST(StartCollectTest, MarksItsChildrenWhileTheyRun) {
+  int seen = 0;
+  OnSleep([&] {
+    for (const char* kind : {"udc", "log"}) {
+      const std::string marker =
+          "/tmp/quendel/" + std::string(kind) + ".p." + std::to_string(ChildOf(kind));
+      EXPECT_EQ(ReadFile(marker), "");
+      EXPECT_EQ(kill(ChildOf(kind), 0), 0);
+    }
+    ++seen;
+  });
+  ReplaceCollector("udc", Hang);
+  ReplaceCollector("log", Hang);
+  WaitLimit("1");
+  EXPECT_EQ(QUENDELStartCollect(1, 0, PerfSeries()), -1);
+  EXPECT_EQ(seen, 1);
+  EXPECT_THAT(LeftInWorkRoot(), IsEmpty());
+}
+
+TEST(StartCollectTest, GoesOnWithoutAMarker) {
+  InstallCollectors();
+  FailCall("ALIBCFileTouch", 0, -1);
+  EXPECT_EQ(Collect(), 0);
+  EXPECT_THAT(Log(),
+              ElementsAre(Logged(kUnit, StartsWith("Failed to touch file '/tmp/quendel/udc.p.")),
+                          Logged(kUnit, StartsWith("Failed to touch file '/tmp/quendel/log.p."))));
+}
+
+TEST(StartCollectTest, TellsWhichMarkerItCannotRemove) {
+  ReplaceCollector("udc", EndWhenTold);
+  ReplaceCollector("log", EndWhenTold);
+  OnSleep([] {
+    for (const std::string kind : {"udc", "log"}) {
+      if (!Exists("/tmp/end")) {
+        const std::string marker = "/tmp/quendel/" + kind + ".p." + std::to_string(ChildOf(kind));
+        RemoveFile(marker);
+        WriteFile(marker + "/a-folder-now", "");
+      }
+    }
+    WriteFile("/tmp/end", "");
+    AwaitAnyChild();
+  });
+  EXPECT_EQ(QUENDELStartCollect(0, 0, PerfSeries()), 0);
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, MatchesRegex("Failed to remove /tmp/quendel/"
+                                                            "udc.p.[0-9]+ .errno=39.")),
+                                 Logged(kUnit, MatchesRegex("Failed to remove /tmp/quendel/"
+                                                            "log.p.[0-9]+ .errno=39."))));
+}
+
+TEST(StartCollectTest, SucceedsWhateverBecomesOfTheCollectors) {
+  StopTheClock();
+  RemoveFile("/usr/arvo/etc/quendel");
+  EXPECT_EQ(Collect(), 0);
+  EXPECT_THAT(Log(), Contains(Logged(kUnit, "Error occured when child collecting log")));
+  EXPECT_THAT(Log(), Contains(Logged(kUnit, "Error occured when child collecting UDC")));
+  EXPECT_TRUE(Exists(kArchive));
+}
+
+TEST(StartCollectTest, EndsItsChildrenWithStatusZeroWhateverBecameOfThem) {
+  for (const char* kind : {"udc", "log"}) {
+    ReplaceCollector(kind, [](const char* directory) { return EndWhenTold(directory) - 1; });
+  }
+  WaitLimit("1");
+  OnSleep([] {
+    WriteFile("/tmp/end", "");
+    for (const char* kind : {"udc", "log"}) {
+      siginfo_t ended = {};
+      EXPECT_EQ(waitid(P_PID, static_cast<id_t>(ChildOf(kind)), &ended, WEXITED | WNOWAIT), 0);
+      EXPECT_EQ(ended.si_code, CLD_EXITED);
+      EXPECT_EQ(ended.si_status, 0);
+    }
+  });
+  EXPECT_EQ(QUENDELStartCollect(1, 0, PerfSeries()), -1);
+}
+
+TEST(StartCollectTest, GivesEachCollectorItsDirectory) {
+  StopTheClock();
+  for (const char* kind : {"udc", "log"}) {
+    ReplaceCollector(kind, [](const char* directory) {
+      WriteFile(std::string(directory) + "/made-by", directory);
+      return 0;
+    });
+  }
+  EXPECT_EQ(Collect(), 0);
+  for (const std::string kind : {"udc", "log"}) {
+    EXPECT_EQ(ArchiveEntries(kArchive).at(kRunName + ("/" + kind) + "/made-by"),
+              kRunDir + ("/" + kind));
+  }
+}
+
+TEST(StartCollectTest, GivesItsChildrenTheDefaultActionForSigterm) {
+  StopTheClock();
+  EXPECT_EQ(InAGroupOfItsOwn([] {
+              signal(SIGTERM, [](int) {});
+              MaskSigterm(SIG_BLOCK);
+              for (const char* kind : {"udc", "log"}) {
+                ReplaceCollector(kind, [](const char* directory) {
+                  WriteFile(std::string(directory) + "/sigterm", SigtermState());
+                  return 0;
+                });
+              }
+              const int result = Collect();
+              EXPECT_EQ(SigtermState(), "handled blocked");
+              return result;
+            }).result,
+            0);
+  for (const std::string kind : {"udc", "log"}) {
+    EXPECT_EQ(ReadFile(kRunDir + ("/" + kind) + "/sigterm"), "default unblocked");
+  }
+}
+
+TEST(StartCollectTest, LeavesTheCallersSigtermUnblocked) {
+  ASSERT_EQ(Collect(), 0);
+  EXPECT_EQ(SigtermState(), "default unblocked");
+}
+
+TEST(StartCollectTest, GoesOnWhenAChildCannotSetItsActionForSigterm) {
+  StopTheClock();
+  FailCall("signal", 1, -1, EINVAL);
+  EXPECT_EQ(Collect(), 0);
+  EXPECT_THAT(
+      Log(),
+      UnorderedElementsAre(
+          Logged(kUnit, "Failed to setup signal handler for udc collector: Invalid argument"),
+          Logged(kUnit, "Failed to setup signal handler for log collector: Invalid argument")));
+}
+
+TEST(StartCollectTest, GivesItsChildrenNothingToRead) {
+  StopTheClock();
+  ReplaceCollector("udc", [](const char* directory) {
+    WriteFile(std::string(directory) + "/input", std::filesystem::read_symlink("/proc/self/fd/0"));
+    return 0;
+  });
+  int ends[2];
+  ASSERT_EQ(pipe(ends), 0);
+  ASSERT_EQ(dup2(ends[0], STDIN_FILENO), STDIN_FILENO);
+  EXPECT_EQ(Collect(), 0);
+  EXPECT_EQ(ReadFile(std::string(kRunDir) + "/udc/input"), "/dev/null");
+}
+
+TEST(StartCollectTest, KeepsAnExceptionInsideTheChild) {
+  StopTheClock();
+  EXPECT_EQ(InAGroupOfItsOwn([] {
+              const pid_t caller = getpid();
+              ReplaceCollector("log", [](const char*) -> int { throw std::runtime_error("lost"); });
+              const int result = Collect();
+              if (getpid() != caller) {
+                WriteFile("/tmp/escaped", "");
+              }
+              return result;
+            }).result,
+            0);
+  EXPECT_FALSE(Exists("/tmp/escaped"));
+  EXPECT_TRUE(Exists(kArchive));
+}
+
+TEST(StartCollectTest, GoesOnWhenTheSeriesCannotBeWritten) {
+  StopTheClock();
+  InstallCollectors();
+  WriteFile(std::string(kRunDir) + "/perf", "no directory");
+  FailCall("ALIBCFileCheckDir", 2, 0);  // asked whether the name is taken
+  EXPECT_EQ(Collect(), 0);
+  EXPECT_THAT(Log(), SizeIs(13));
+  EXPECT_THAT(Log(), Contains(Logged(kUnit, "Error occured when parse perf data")));
+  EXPECT_EQ(ArchiveEntries(kArchive).count(std::string(kRunName) + "/log/messages"), 1U);
+}
+
+TEST(StartCollectTest, TakesAnyKindOfSeries) {
+  StopTheClock();
+  OnSleep(AwaitAnyChild);
+  EXPECT_EQ(QUENDELStartCollect(0, 0, JsonOf("[\"no\",\"series\"]")), 0);
+  EXPECT_EQ(ReadFile(std::string(kRunDir) + "/perf/quendel.perf.System"), "null");
+}
+
+TEST(StartCollectTest, WaitsNoLongerThanItsChildrenTake) {
+  ReplaceCollector("udc", DoNothing);
+  ReplaceCollector("log", DoNothing);
+  EXPECT_EQ(Collect(), 0);
+  EXPECT_LE(SleptSeconds(), 2);
+}
+
+TEST(StartCollectTest, GivesItsChildrenTheConfiguredTime) {
+  WaitLimit("5");
+  ReplaceCollector("udc", Hang);
+  ReplaceCollector("log", DoNothing);
+  OnSleep([] { AwaitChild("log"); });
+  EXPECT_EQ(QUENDELStartCollect(1, 0, PerfSeries()), -1);
+  EXPECT_EQ(SleptSeconds(), 5);
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Timeout when wait child done")));
+  EXPECT_THAT(LeftInTmp(), ElementsAre("quendel"));
+}
+
+TEST(StartCollectTest, CountsAChildThatEndsInTheLastSecondAsTooLate) {
+  InstallCollectors();
+  WaitLimit("1");
+  ReplaceCollector("udc", EndWhenTold);
+  const auto before = CollectorConf();
+  OnSleep([] {
+    WriteFile("/tmp/end", "");
+    AwaitChild("udc");
+    AwaitChild("log");
+  });
+  EXPECT_EQ(QUENDELStartCollect(0, 0, PerfSeries()), -1);
+  EXPECT_EQ(SleptSeconds(), 1);
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Timeout when wait child done")));
+  EXPECT_EQ(CollectorConf(), before);
+}
+
+TEST(StartCollectTest, CountsOnlySecondsSlept) {
+  WaitLimit("2");
+  ReplaceCollector("udc", EndWhenTold);
+  ReplaceCollector("log", EndWhenTold);
+  OnSleep([] {
+    WriteFile("/tmp/end", "");
+    AwaitChild("udc");
+    AwaitChild("log");
+  });
+  EXPECT_EQ(QUENDELStartCollect(1, 0, PerfSeries()), 0);
+  EXPECT_EQ(SleptSeconds(), 1);
+}
+
+TEST(StartCollectTest, EndsAChildThatTookTooLong) {
+  WaitLimit("1");
+  ReplaceCollector("udc", Hang);
+  ReplaceCollector("log", Hang);
+  pid_t udc = 0;
+  pid_t log = 0;
+  OnSleep([&] {
+    udc = ChildOf("udc");
+    log = ChildOf("log");
+  });
+  EXPECT_EQ(QUENDELStartCollect(1, 0, PerfSeries()), -1);
+  EXPECT_EQ(kill(udc, 0), -1);
+  EXPECT_EQ(kill(log, 0), -1);
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Timeout when wait child done")));
+}
+
+TEST(StartCollectTest, EndsAChildOfACallerThatIgnoresOrBlocksSigterm) {
+  WaitLimit("1");
+  const Ending ending = RunIgnoringSigterm([] {
+    MaskSigterm(SIG_BLOCK);
+    ReplaceCollector("udc", Hang);
+    ReplaceCollector("log", Hang);
+    return QUENDELStartCollect(1, 0, PerfSeries());
+  });
+  EXPECT_EQ(ending.result, -1);
+  EXPECT_EQ(ending.signal, 0);
+  EXPECT_FALSE(ending.group_got_sigterm);
+}
+
+// A user-defined collector that keeps its child busy for longer than the run waits.
+TEST(StartCollectTest, WaitsForNoUserDefinedCollectorBeyondTheLimit) {
+  const std::vector<std::string> scripts = {
+      "touch /tmp/started; exec sleep 1000",                    // hangs
+      "trap '' TERM; touch /tmp/started; exec sleep 1000",      // and ignores SIGTERM
+      "touch /tmp/started; exec yes",                           // floods
+      "exec >&-; touch /tmp/started; exec sleep 1000",          // closes its output early
+      "sleep 1000 & touch /tmp/started; echo '{\"disks\":4}'",  // leaves its output to another
+  };
+  for (const std::string& script : scripts) {
+    InstallCollectors(script);
+    const auto before = CollectorConf();
+    RemoveFile("/tmp/started");
+    ClearLog();
+    const Ending ending = InAGroupOfItsOwn([] {
+      WaitLimit("1");
+      OnSleep([] {
+        while (!Exists("/tmp/started")) {
+          usleep(1000);
+        }
+      });
+      return QUENDELStartCollect(1, 0, PerfSeries());
+    });
+    EXPECT_EQ(ending.result, -1) << script;
+    EXPECT_FALSE(ending.group_got_sigterm);
+    EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Timeout when wait child done"))) << script;
+    EXPECT_EQ(CollectorConf(), before);
+  }
+}
+
+TEST(StartCollectTest, GoesOnWhenAUserDefinedCollectorDies) {
+  StopTheClock();
+  InstallCollectors("kill -9 $$");
+  EXPECT_EQ(Collect(), 0);
+  EXPECT_EQ(ArchiveEntries(kArchive).at(std::string(kRunName) + "/log/messages"),
+            "first\nsecond\n");
+}
+
+TEST(StartCollectTest, WaitsForNothingThatACollectorLeavesBehind) {
+  StopTheClock();
+  InstallCollectors("sleep 1000 >/dev/null & echo '{\"disks\":4}'");
+  EXPECT_EQ(Collect(), 0);
+  ExpectCollected(kRunName);
+}
+
+TEST(StartCollectTest, ReportsAStoppedChildAndGoesOn) {
+  WaitLimit("1");
+  ReplaceCollector("udc", Hang);
+  pid_t udc = 0;
+  OnSleep([&] {
+    udc = ChildOf("udc");
+    siginfo_t stopped;
+    ASSERT_EQ(kill(udc, SIGSTOP), 0);
+    ASSERT_EQ(waitid(P_PID, static_cast<id_t>(udc), &stopped, WSTOPPED | WNOWAIT), 0);
+  });
+  EXPECT_EQ(QUENDELStartCollect(1, 0, PerfSeries()), -1);
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Timeout when wait child done"),
+                                 Logged(kUnit, std::to_string(udc) + " status " +
+                                                   std::to_string(W_STOPCODE(SIGSTOP)))));
+}
+
+TEST(StartCollectTest, CountsAChildThatDiedAsFinished) {
+  StopTheClock();
+  InstallCollectors();
+  ReplaceCollector("udc", Die);
+  EXPECT_EQ(Collect(), 0);
+  const auto entries = ArchiveEntries(kArchive);
+  EXPECT_EQ(entries.count(std::string(kRunName) + "/udc/udc.result"), 0U);
+  EXPECT_EQ(entries.at(std::string(kRunName) + "/log/messages"), "first\nsecond\n");
+}
+
+TEST(StartCollectTest, NeverCommitsWhatAnOlderRunStaged) {
+  InstallCollectors();
+  WriteFile(quendel::kLogUpdateFile,
+            "[/usr/arvo/etc/quendel/quendel.log.messages]\ntotal_byte=999\n");
+  WriteFile(quendel::kUdcUpdateFile, "[/usr/arvo/etc/quendel/quendel.udc.raid]\nlast_hash=999\n");
+  const auto before = CollectorConf();
+  for (const char* kind : {"udc", "log"}) {
+    ReplaceCollector(kind, Die);
+  }
+  EXPECT_EQ(Collect(), 0);
+  EXPECT_EQ(CollectorConf(), before);
+  EXPECT_THAT(Log(), IsEmpty());
+}
+
+TEST(StartCollectTest, FailsWhenAChildOfTheCallerEndsMeanwhile) {
+  InstallCollectors();
+  const auto before = CollectorConf();
+  const Ending ending = InAGroupOfItsOwn([] {
+    ReplaceCollector("udc", Hang);
+    ReplaceCollector("log", Hang);
+    if (fork() == 0) {
+      _exit(7);
+    }
+    return Collect();
+  });
+  EXPECT_EQ(ending.result, -1);
+  EXPECT_FALSE(ending.group_got_sigterm);
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Error happened when wait all children done")));
+  EXPECT_EQ(CollectorConf(), before);
+}
+
+TEST(StartCollectTest, FailsWhenTheCallerIgnoresTheEndOfChildren) {
+  const Ending ending = InAGroupOfItsOwn([] {
+    signal(SIGCHLD, SIG_IGN);
+    return Collect();
+  });
+  EXPECT_EQ(ending.result, -1);
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Error happened when wait all children done")));
+}
+
+TEST(StartCollectTest, LeavesOtherChildrenOfTheCallerAlone) {
+  const Ending ending = InAGroupOfItsOwn([] {
+    const pid_t other = fork();
+    if (other == 0) {
+      Hang(nullptr);
+    }
+    ReplaceCollector("udc", DoNothing);
+    ReplaceCollector("log", DoNothing);
+    const int result = Collect();
+    EXPECT_EQ(waitpid(other, nullptr, WNOHANG), 0);
+    kill(other, SIGKILL);
+    return result;
+  });
+  EXPECT_EQ(ending.result, 0);
+}
+
+TEST(StartCollectTest, ProbesItsChildrenAndNobodyElseAfterward) {
+  Record("kill");
+  pid_t udc = 0;
+  pid_t log = 0;
+  OnSleep([&] {
+    udc = ChildOf("udc");
+    log = ChildOf("log");
+    AwaitAnyChild();
+  });
+  ReplaceCollector("log", [](const char*) { return usleep(100000); });
+  ASSERT_EQ(QUENDELStartCollect(1, 0, PerfSeries()), 0);
+  EXPECT_THAT(Recorded(), ElementsAre(std::to_string(udc) + "|0", std::to_string(log) + "|0"));
+}
+
+TEST(StartCollectTest, TellsWhichChildItCannotSignal) {
+  WaitLimit("1");
+  for (const char* kind : {"udc", "log"}) {
+    ReplaceCollector(kind, EndWhenTold);
+  }
+  FailCall("kill", 2, -1, EPERM);  // the first is the probe
+  OnSleep([] {
+    if (fork() == 0) {
+      while (Log().size() < 2) {
+        usleep(1000);
+      }
+      WriteFile("/tmp/end", "");
+      _exit(0);
+    }
+  });
+  EXPECT_EQ(QUENDELStartCollect(1, 0, PerfSeries()), -1);
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Timeout when wait child done"),
+                                 Logged(kUnit, "Failed to kill a child for udc")));
+}
+
+TEST(StartCollectTest, SignalsTheCallersGroupWhenItFailsBeforeItHasChildren) {
+  const Ending ending = InAGroupOfItsOwn([] {
+    FailCall("time", 1, -1);
+    return Collect();
+  });
+  EXPECT_EQ(ending.signal, SIGTERM);
+  EXPECT_TRUE(ending.group_got_sigterm);
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to get current time")));
+}
+
+TEST(StartCollectTest, CleansUpInACallerThatSurvivesTheSignal) {
+  const Ending ending = RunIgnoringSigterm([] {
+    FailCall("time", 1, -1);
+    Record("kill");
+    const int result = Collect();
+    EXPECT_THAT(Recorded(), ElementsAre("0|0", "0|15", "0|0", "0|15"));
+    return result;
+  });
+  EXPECT_EQ(ending.result, -1);
+  EXPECT_EQ(ending.signal, 0);
+  EXPECT_TRUE(ending.group_got_sigterm);
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to get current time"),
+                                 NothingToWaitFor("udc"), NothingToWaitFor("log")));
+}
+
+TEST(StartCollectTest, EndsAndReapsAChildOfTheCallersGroup) {
+  const Ending ending = RunIgnoringSigterm([] {
+    FailCall("time", 1, -1);
+    const pid_t other = fork();
+    if (other == 0) {
+      signal(SIGTERM, SIG_DFL);
+      Hang(nullptr);
+    }
+    usleep(100000);  // for its action to be set
+    const int result = Collect();
+    EXPECT_EQ(kill(other, 0), -1);
+    return result;
+  });
+  EXPECT_EQ(ending.result, -1);
+  EXPECT_THAT(Log(),
+              ElementsAre(Logged(kUnit, "Failed to get current time"), NothingToWaitFor("log")));
+}
+
+TEST(StartCollectTest, FailsWhenADirectoryCannotBeMade) {
+  const std::vector<std::pair<std::string, std::string>> directories = {
+      {"UDC", quendel::kWorkRoot},
+      {"quendel", kRunDir},
+      {"UDC", kRunDir + std::string("/udc")},
+      {"log", kRunDir + std::string("/log")},
+      {"perf", kRunDir + std::string("/perf")},
+  };
+  for (size_t i = 0; i < directories.size(); ++i) {
+    RemoveFile(kRunDir);
+    RemoveFile(quendel::kWorkRoot);
+    ClearLog();
+    const Ending ending = RunIgnoringSigterm([i] {
+      StopTheClock();
+      FailCall("mkdir", static_cast<int>(i) + 1, -1, EACCES);
+      const int result = Collect();
+      EXPECT_EQ(Calls("ALIBCProcForkEx"), 0);
+      return result;
+    });
+    EXPECT_EQ(ending.result, -1);
+    EXPECT_TRUE(ending.group_got_sigterm);
+    const auto& [what, path] = directories[i];
+    EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to create " + what + " collect dir '" +
+                                                     path + "'"),
+                                   NothingToWaitFor("udc"), NothingToWaitFor("log")));
+  }
+}
+
+TEST(StartCollectTest, TakesAFileInTheWorkRootsPlaceForADirectory) {
+  WriteFile(quendel::kWorkRoot, "");
+  EXPECT_EQ(Collect(), 0);
+  EXPECT_THAT(Log(), Contains(Logged(kUnit, StartsWith("Failed to touch file"))).Times(2));
+}
+
+TEST(StartCollectTest, FailsWithoutAUdcChild) {
+  const Ending ending = RunIgnoringSigterm([] {
+    FailCall("ALIBCProcForkEx", 1, -1);
+    return Collect();
+  });
+  EXPECT_EQ(ending.result, -1);
+  EXPECT_TRUE(ending.group_got_sigterm);
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to fork a child to collect udc"),
+                                 Logged(kUnit, "Failed to collect UDC"), NothingToWaitFor("udc"),
+                                 NothingToWaitFor("log")));
+}
+
+TEST(StartCollectTest, EndsTheUdcChildWhenThereIsNoLogChild) {
+  const Ending ending = RunIgnoringSigterm([] {
+    FailCall("ALIBCProcForkEx", 2, -1);
+    ReplaceCollector("udc", Hang);
+    return Collect();
+  });
+  EXPECT_EQ(ending.result, -1);
+  EXPECT_TRUE(ending.group_got_sigterm);
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to fork a child to collect log"),
+                                 Logged(kUnit, "Failed to collect logs"), NothingToWaitFor("log")));
+  EXPECT_THAT(LeftInWorkRoot(), IsEmpty());
+}
+
+// The signal comes before the child has set its action for it, more often than not.
+TEST(StartCollectTest, EndsAChildThatHasHardlyBegun) {
+  for (int i = 0; i < 20; ++i) {
+    const Ending ending = RunIgnoringSigterm([] {
+      FailCall("ALIBCProcForkEx", 2, -1);
+      ReplaceCollector("udc", Hang);
+      return Collect();
+    });
+    ASSERT_EQ(ending.signal, 0);
+    ASSERT_EQ(ending.result, -1);
+  }
+}
+
+TEST(StartCollectTest, FailsWhenTheDirectoryCannotBePacked) {
+  StopTheClock();
+  InstallCollectors();
+  FailCall("ALIBCExecl", 1, 2);
+  EXPECT_EQ(Collect(), -1);
+  EXPECT_THAT(Log(), ElementsAre(Logged("quendel_tar_collect_data",
+                                        "Failed to tar '" + std::string(kRunDir) + "'")));
+}
+
+TEST(StartCollectTest, NeverContactsTheServerUnlessAsked) {
+  InstallCollectors();
+  const auto before = CollectorConf();
+  EXPECT_EQ(Collect(), 0);
+  EXPECT_EQ(Calls("gethostbyname"), 0);
+  EXPECT_EQ(Calls("socket"), 0);
+  EXPECT_EQ(Calls("curl_easy_init"), 0);
+  EXPECT_NE(CollectorConf(), before);
+}
+
+TEST(StartCollectTest, FailsWhenTheLogsStateCannotBeCommitted) {
+  InstallCollectors();
+  const auto before = CollectorConf();
+  FailCall("ALIBCFileEnumSection", 1, -1);
+  EXPECT_EQ(Collect(), -1);
+  EXPECT_THAT(Log(), ElementsAre(Logged("quendel_update_conf", _),
+                                 Logged(kUnit, "Failed to update log config")));
+  EXPECT_EQ(CollectorConf(), before);
+}
+
+TEST(StartCollectTest, FailsWhenTheUserDefinedCollectorsStateCannotBeCommitted) {
+  InstallCollectors();
+  const auto before = CollectorConf();
+  FailCall("ALIBCFileEnumSection", 2, -1);
+  EXPECT_EQ(Collect(), -1);
+  EXPECT_THAT(Log(), ElementsAre(Logged("quendel_update_conf", _),
+                                 Logged(kUnit, "Failed to update udc config")));
+  const char* udc = "/usr/arvo/etc/quendel/quendel.udc.raid";
+  EXPECT_EQ(CollectorConf().at(udc), before.at(udc));
+  EXPECT_NE(CollectorConf(), before);
+}
+
+TEST(StartCollectTest, SucceedsWhenTheRunDirectoryCannotBeRemoved) {
+  StopTheClock();
+  FailCall("ALIBCopyRemoveDir", 1, -1, EBUSY);
+  EXPECT_EQ(Collect(1), 0);
+  EXPECT_THAT(Log(),
+              ElementsAre(Logged(kUnit, "Error happened when remove " + std::string(kRunDir) +
+                                            ", errno:16 [Device or resource busy]")));
+  EXPECT_FALSE(Exists(kArchive));
+}
+
+TEST(StartCollectTest, TellsWhenTheArchiveCannotBeRemoved) {
+  StopTheClock();
+  WriteFile(std::string(kArchive) + "/in-its-place", "");
+  EXPECT_EQ(Collect(1), -1);
+  EXPECT_THAT(Log(), ElementsAre(Logged("quendel_tar_collect_data", _),
+                                 Logged(kUnit, "Failed to remove " + std::string(kArchive) +
+                                                   " [errno=39]")));
+  EXPECT_FALSE(Exists(kRunDir));
+}
+
+// Whatever ends a run before its archive is made, the next run finds the same to collect.
+TEST(StartCollectTest, LeavesNoTraceOfARunThatFailed) {
+  InstallCollectors();
+  const auto before = CollectorConf();
+  const std::vector<std::function<void()>> faults = {
+      [] { FailCall("mkdir", 1, -1, ENOSPC); },
+      [] { FailCall("mkdir", 2, -1, ENOSPC); },
+      [] { FailCall("mkdir", 3, -1, ENOSPC); },
+      [] { FailCall("mkdir", 4, -1, ENOSPC); },
+      [] { FailCall("time", 1, -1); },
+      [] { FailCall("ALIBCProcForkEx", 1, -1); },
+      [] { FailCall("ALIBCProcForkEx", 2, -1); },
+      [] { FailCall("waitpid", 1, -1, ECHILD); },
+      [] { FailCall("waitpid", 1, 999999); },
+      [] {
+        WaitLimit("1");
+        ReplaceCollector("udc", Hang);
+      },
+      [] { FailCall("ALIBCExecl", 1, -1); },
+      [] { FailCall("ALIBCExecl", 1, 2); },
+      [] { FailCall("ALIBCFileEnumSection", 1, -1); },
+  };
+  for (size_t i = 0; i < faults.size(); ++i) {
+    const Ending ending = RunIgnoringSigterm([&] {
+      OnSleep([] { AwaitChild("log"); });
+      faults[i]();
+      return QUENDELStartCollect(1, 0, PerfSeries());
+    });
+    EXPECT_EQ(ending.result, -1) << i;
+    EXPECT_EQ(CollectorConf(), before) << i;
+    EXPECT_THAT(LeftInTmp(), Each("quendel")) << i;
+  }
+  WaitLimit("600");
+  StopTheClock();
+  EXPECT_EQ(Collect(), 0);
+  ExpectCollected(kRunName);
+}
+
+// What could not be written whole is not counted as collected, however little room there is.
+TEST(StartCollectTest, LosesNothingToAFullDisk) {
+  InstallCollectors();
+  std::string noise;  // which xz cannot make much smaller
+  for (unsigned int i = 1, seed = 1; i <= 150000; ++i) {
+    seed = seed * 1103515245 + 12345;
+    noise.push_back(i % 100 == 0 ? '\n' : static_cast<char>(' ' + (seed >> 16) % 94));
+  }
+  WriteFile("/volume1/messages", noise);
+  const std::string log = "/usr/arvo/etc/quendel/quendel.log.messages";
+  const std::string udc = "/usr/arvo/etc/quendel/quendel.udc.raid";
+  const auto before = CollectorConf();
+  int failures = 0;
+  int partial = 0;
+  for (int kibibytes = 4; kibibytes < 320; kibibytes += 12) {
+    const std::string options = "size=" + std::to_string(kibibytes) + "k";
+    ASSERT_EQ(mount("tmpfs", "/tmp", "tmpfs", 0, options.c_str()), 0);
+    StopTheClock();
+    const bool collected = RunIgnoringSigterm([] { return Collect(); }).result == 0;
+    const auto after = CollectorConf();
+    const auto entries =
+        collected ? ArchiveEntries(kArchive) : std::map<std::string, std::string>();
+    if (after.at(log) != before.at(log)) {
+      EXPECT_TRUE(entries.at(std::string(kRunName) + "/log/messages") == noise) << kibibytes;
+    }
+    if (after.at(udc) != before.at(udc)) {
+      EXPECT_EQ(JsonOf(entries.at(std::string(kRunName) + "/udc/udc.result")),
+                JsonOf(R"({"raid":{"disks":4}})"))
+          << kibibytes;
+    }
+    failures += collected ? 0 : 1;
+    partial += collected && after.at(log) == before.at(log) ? 1 : 0;
+    for (const auto& [path, text] : before) {
+      WriteFile(path, text);
+    }
+    ASSERT_EQ(umount2("/tmp", MNT_DETACH), 0);
+    ASSERT_FALSE(testing::Test::HasFailure()) << kibibytes;
+  }
+  EXPECT_GT(failures, 0);  // the archive did not fit
+  EXPECT_GT(partial, 0);   // the log did not, and the archive of the rest did
+  EXPECT_EQ(Collect(), 0);
+  EXPECT_NE(CollectorConf().at(log), before.at(log));
+}
+
+TEST(StartCollectorChildTest, KnowsTwoKindsOfChildren) {
+  for (const char* kind : {"", "perf", "UDC", "logs"}) {
+    ClearLog();
+    quendel::CollectorChild child = {kind};
+    EXPECT_EQ(quendel::StartCollectorChild(child), -1);
+    EXPECT_EQ(child.id, 0);
+    EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Bad parameter of data: " + std::string(kind))));
+  }
+  EXPECT_EQ(Calls("ALIBCProcForkEx"), 0);
+}
