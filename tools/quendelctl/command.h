@@ -30,8 +30,9 @@ struct Command {
   Action (*declare)(CLI::App& command);
 };
 
-extern const std::vector<Command> kConversationCommands;
-extern const std::vector<Command> kDeviceCommands;
+// The families of commands.
+std::vector<Command> ConversationCommands();
+std::vector<Command> DeviceCommands();
 
 }  // namespace quendelctl
 

@@ -154,24 +154,26 @@ Action DeclareProgress(CLI::App& command) {
 
 }  // namespace
 
-const std::vector<Command> kConversationCommands = {
-    {"heartbeat", "Tell the server that the device is alive and show the actions it queued",
-     R"(Examples:
+std::vector<Command> ConversationCommands() {
+  return {
+      {"heartbeat", "Tell the server that the device is alive and show the actions it queued",
+       R"(Examples:
   quendelctl heartbeat
   quendelctl heartbeat --json)",
-     DeclareHeartbeat},
-    {"event", "Report an event of the device to the server",
-     R"(Examples:
+       DeclareHeartbeat},
+      {"event", "Report an event of the device to the server",
+       R"(Examples:
   quendelctl event reboot
   quendelctl event enable --info '{"model": "X"}'
   quendelctl event enable --info device.json)",
-     DeclareEvent},
-    {"progress", "Tell the server how an action stands that it requested",
-     R"(Examples:
+       DeclareEvent},
+      {"progress", "Tell the server how an action stands that it requested",
+       R"(Examples:
   quendelctl progress 17 done
   quendelctl progress 17 -3
   quendelctl progress 17 failed --details '{"reason": "disk full"}')",
-     DeclareProgress},
-};
+       DeclareProgress},
+  };
+}
 
 }  // namespace quendelctl

@@ -80,28 +80,30 @@ Action WithoutArguments(CLI::App& /*command*/) {
 
 }  // namespace
 
-const std::vector<Command> kDeviceCommands = {
-    {"server", "Show the host name of the service's server",
-     R"(Examples:
+std::vector<Command> DeviceCommands() {
+  return {
+      {"server", "Show the host name of the service's server",
+       R"(Examples:
   quendelctl server
   quendelctl server --json)",
-     WithoutArguments<ShowServer>},
-    {"test-connection", "Find out whether the server can be reached",
-     R"(Takes one to five seconds, and longer where a firewall swallows the attempts.
+       WithoutArguments<ShowServer>},
+      {"test-connection", "Find out whether the server can be reached",
+       R"(Takes one to five seconds, and longer where a firewall swallows the attempts.
 
 Example:
   quendelctl test-connection && echo reachable)",
-     WithoutArguments<TestConnection>},
-    {"facts", "Show the device's model, version, time and settings of the service",
-     R"(Examples:
+       WithoutArguments<TestConnection>},
+      {"facts", "Show the device's model, version, time and settings of the service",
+       R"(Examples:
   quendelctl facts
   quendelctl facts --json)",
-     WithoutArguments<ShowFacts>},
-    {"version", "Show the version of libquendel",
-     R"(Examples:
+       WithoutArguments<ShowFacts>},
+      {"version", "Show the version of libquendel",
+       R"(Examples:
   quendelctl version
   quendelctl version --json)",
-     WithoutArguments<ShowVersion>},
-};
+       WithoutArguments<ShowVersion>},
+  };
+}
 
 }  // namespace quendelctl

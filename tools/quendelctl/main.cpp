@@ -28,8 +28,7 @@ constexpr char kFooter[] =
 Exit status: 0 success, 1 the operation failed, 2 the command line is wrong.
 The reasons of a failure go to the standard error output and to the system's log.)";
 
-const std::vector<const std::vector<Command>*> kFamilies = {&kConversationCommands,
-                                                            &kDeviceCommands};
+constexpr std::vector<Command> (*kFamilies[])() = {ConversationCommands, DeviceCommands};
 
 // What the command line asked for.
 struct Request {
@@ -51,8 +50,8 @@ void DeclareCommandLine(CLI::App& app, Request& request) {
   app.get_formatter()->column_width(20);
   app.set_version_flag("--version", "quendelctl " QUENDEL_VERSION, "Print the version and exit");
   app.require_subcommand(0, 1);
-  for (const std::vector<Command>* family : kFamilies) {
-    for (const Command& command : *family) {
+  for (const auto& family : kFamilies) {
+    for (const Command& command : family()) {
       DeclareCommand(app, command, request);
     }
   }
