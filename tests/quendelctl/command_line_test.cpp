@@ -55,7 +55,7 @@ TEST(CommandLineTest, TellsItsVersion) {
 
 TEST(CommandLineTest, NeedsACommand) {
   ExpectUsageError({}, "A command is required");
-  ExpectUsageError({"nosuch"}, "A command is required");
+  ExpectUsageError({"nosuch"}, "The following argument was not expected: nosuch");
 }
 
 TEST(CommandLineTest, RejectsWhatACommandDoesNotTake) {

@@ -12,11 +12,21 @@
 namespace quendelctl {
 namespace {
 
-std::string JsonLine(const Json::Value& value, bool ascii) {
+std::string JsonLine(const Json::Value& value, bool utf8) {
   Json::StreamWriterBuilder builder;
   builder["indentation"] = "";
-  builder["emitUTF8"] = !ascii;
+  builder["emitUTF8"] = utf8;
   return Json::writeString(builder, value);
+}
+
+// Without UTF-8 JsonCpp escapes every character that does not print, but for this one.
+std::string AsciiJsonLine(const Json::Value& value) {
+  constexpr char kDelete = '\x7f';
+  std::string line = JsonLine(value, false);
+  for (size_t at = line.find(kDelete); at != line.npos; at = line.find(kDelete, at)) {
+    line.replace(at, 1, "\\u007f");
+  }
+  return line;
 }
 
 }  // namespace
@@ -25,7 +35,7 @@ void PrintResult(const Result& result, bool json) {
   if (json) {
     Json::Value object = result.members;
     object["success"] = result.success;
-    PrintText(JsonLine(object, true) + "\n");
+    PrintText(AsciiJsonLine(object) + "\n");
     return;
   }
   for (const std::string& line : result.lines) {
@@ -46,7 +56,7 @@ void FinishOutput() {
 }
 
 std::string JsonForReader(const Json::Value& value) {
-  return JsonLine(value, false);
+  return JsonLine(value, true);
 }
 
 }  // namespace quendelctl
