@@ -38,8 +38,8 @@ struct Collector {
   const char* failure;
 };
 constexpr Collector kCollectors[] = {
-    {"udc", QUENDELCollectUDC, "Error occured when child collecting UDC"},  // [sic]
-    {"log", QUENDELCollectLog, "Error occured when child collecting log"},  // [sic]
+    {"udc", QUENDELCollectUDC, "Error occured when child collecting UDC"},  // [sic] message
+    {"log", QUENDELCollectLog, "Error occured when child collecting log"},  // [sic] message
 };
 
 struct Run {
