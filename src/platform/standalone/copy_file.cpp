@@ -15,7 +15,7 @@
 namespace platform {
 namespace {
 
-constexpr size_t kBlockBytes = 256 * 1024;
+constexpr size_t kBlockBytes = size_t{256} * 1024;
 constexpr size_t kMaxKernelCopyBytes = size_t{1} << 30;
 
 // Where a copy goes.

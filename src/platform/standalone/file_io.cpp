@@ -11,7 +11,7 @@
 namespace platform {
 namespace {
 
-constexpr size_t kReadBlockBytes = 64 * 1024;
+constexpr size_t kReadBlockBytes = size_t{64} * 1024;
 
 }  // namespace
 

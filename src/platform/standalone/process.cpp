@@ -80,7 +80,7 @@ class Arguments {
  public:
   explicit Arguments(const char* program) { Add(program); }
   void Add(const char* argument) { argv_.push_back(const_cast<char*>(argument)); }
-  void AddAll(va_list& arguments) {
+  void AddAll(va_list arguments) {
     for (const char* next = va_arg(arguments, const char*); next != nullptr;
          next = va_arg(arguments, const char*)) {
       Add(next);

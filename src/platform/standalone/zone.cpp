@@ -6,6 +6,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <charconv>
 #include <climits>
 #include <cstdio>
 #include <cstdlib>
@@ -139,7 +140,7 @@ bool TakeNumber(std::string_view& rule, int& number) {
   if (length < 1 || length > 3) {
     return false;
   }
-  number = atoi(std::string(rule.substr(0, length)).c_str());
+  std::from_chars(rule.data(), rule.data() + length, number);
   rule.remove_prefix(length);
   return true;
 }
