@@ -81,8 +81,8 @@ class Arguments {
   explicit Arguments(const char* program) { Add(program); }
   void Add(const char* argument) { argv_.push_back(const_cast<char*>(argument)); }
   void AddAll(va_list arguments) {
-    for (const char* next = va_arg(arguments, const char*); next != nullptr;
-         next = va_arg(arguments, const char*)) {
+    // NOLINTNEXTLINE(clang-analyzer-valist.Uninitialized): every caller has started the list.
+    while (const char* next = va_arg(arguments, const char*)) {
       Add(next);
     }
   }
