@@ -5,6 +5,7 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <cstdio>
 
 namespace quendel::test {
 
@@ -56,6 +57,15 @@ ssize_t __wrap_pread(int file, void* buffer, size_t count, off_t offset) {
 ssize_t __real_write(int file, const void* buffer, size_t count);
 ssize_t __wrap_write(int file, const void* buffer, size_t count) {
   return Passes(OnFileCalls().write, count) ? __real_write(file, buffer, count) : -1;
+}
+
+int __real_remove(const char* path);
+int __wrap_remove(const char* path) {
+  if (OnFileCalls().remove && !OnFileCalls().remove(path)) {
+    errno = EPERM;
+    return -1;
+  }
+  return __real_remove(path);
 }
 
 int __real_stat(const char* path, struct stat* status);

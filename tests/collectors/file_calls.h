@@ -19,6 +19,8 @@ struct FileCalls {
   std::function<bool(size_t& count)> sendfile;
   std::function<bool(size_t& count)> pread;
   std::function<bool(size_t& count)> write;
+  // Returns false for a path whose removal is to fail with EPERM.
+  std::function<bool(const char* path)> remove;
   // Changes what stat() has told of a path.
   std::function<void(const char* path, struct stat& status)> stat;
 };
