@@ -1,5 +1,5 @@
-// Replies that a server which nobody authenticated may send. Every function that posts is run through
-// all of them.
+// Replies that a server which nobody authenticated may send. Every function that posts is run
+// through all of them.
 #ifndef SUPPORT_REPLIES_H_
 #define SUPPORT_REPLIES_H_
 

@@ -94,6 +94,8 @@ std::vector<Request> Requests() {
 }
 
 void UseCertificate(const std::string& kind) {
+  Require(kind == "self-signed" || kind == "expired" || kind == "wrong-host",
+          "no certificate of the kind " + kind);
   Hand(Folder() / "certificate", kind);
 }
 
