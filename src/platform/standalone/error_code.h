@@ -22,8 +22,11 @@ enum ErrorCode : int {
   kErrorNoAccount = 0x0700,        // no account is signed in on this device
   kErrorNotStarted = 0x0800,       // the program, or the child process, could not be started
   kErrorStatusLost = 0x0801,       // it ran, but how it ended is not known
-  kErrorNoAnswer = 0x0a00,         // no answer is there to be taken
   kErrorNoTimeZone = 0x0900,       // no time zone is configured, or the name is none
+  kErrorNoAnswer = 0x0a00,         // no answer is there to be taken
+  kErrorRefused = 0x0b00,          // the account is not one that may be changed or deleted
+  kErrorAccountTool = 0x0b01,      // the system's account tool failed
+  kErrorNoSuchAccount = 0x1d00,  // the account does not exist; callers know this one by its number
 };
 
 // Sets the calling thread's last error. Returns -1, the result of most failed operations.

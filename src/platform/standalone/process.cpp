@@ -17,6 +17,7 @@
 
 #include "platform/standalone/error_code.h"
 #include "platform/standalone/file_io.h"
+#include "platform/standalone/run_program.h"
 
 namespace platform {
 namespace {
@@ -201,6 +202,15 @@ FILE* OpenStream(const std::vector<char*>& argv) {
 }
 
 }  // namespace
+
+int RunProgram(std::initializer_list<const char*> arguments) {
+  Arguments vector(*arguments.begin());
+  for (auto next = arguments.begin() + 1; next != arguments.end(); ++next) {
+    vector.Add(*next);
+  }
+  return Run(vector.Finish());
+}
+
 }  // namespace platform
 
 int ALIBCProcForkEx(int /*flags*/) {
