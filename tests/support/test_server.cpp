@@ -410,6 +410,15 @@ class Server {
   int connections_ = 0;
 };
 
+uint16_t PortFrom(const std::string& text) {
+  char* end = nullptr;
+  const unsigned long port = strtoul(text.c_str(), &end, 10);
+  if (port < 1 || port > UINT16_MAX || *end != '\0') {
+    Fail("no port: " + text);
+  }
+  return static_cast<uint16_t>(port);
+}
+
 Settings SettingsFrom(int argc, char** argv) {
   Settings settings;
   for (int i = 1; i < argc; i += 2) {
@@ -423,11 +432,14 @@ Settings SettingsFrom(int argc, char** argv) {
     }
     const std::string value = argv[i + 1];
     if (option == "--port") {
-      settings.port = static_cast<uint16_t>(std::stoul(value));
+      settings.port = PortFrom(value);
     } else if (option == "--host") {
       settings.host = value;
     } else if (option == "--cert") {
       settings.certificate = value;
+      if (value != "self-signed" && value != "expired" && value != "wrong-host") {
+        Fail("no certificate of the kind " + value);
+      }
     } else if (option == "--dir") {
       settings.folder = value;
     } else {
