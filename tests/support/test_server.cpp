@@ -19,6 +19,7 @@
 #include <memory>
 #include <mutex>
 #include <sstream>
+#include <string_view>
 #include <thread>
 
 #include "support/answer_file.h"
@@ -238,16 +239,18 @@ class AnswerWriter {
     if (!SendPiece(answer_.body)) {
       return false;
     }
-    constexpr size_t kBlock = 64 * 1024;
-    for (size_t left = answer_.fill; left > 0; left -= std::min(left, kBlock)) {
-      if (!SendPiece(std::string(std::min(left, kBlock), 'x'))) {
+    const std::string block(std::min<size_t>(answer_.fill, 64 * 1024), 'x');
+    for (size_t left = answer_.fill; left > 0;) {
+      const size_t size = std::min(left, block.size());
+      if (!SendPiece({block.data(), size})) {
         return false;
       }
+      left -= size;
     }
     return SendPiece(answer_.tail) && (!answer_.chunked || Send("0\r\n\r\n"));
   }
 
-  bool SendPiece(const std::string& piece) {
+  bool SendPiece(std::string_view piece) {
     if (!answer_.chunked || piece.empty()) {
       return Send(piece);
     }
@@ -256,20 +259,18 @@ class AnswerWriter {
     return Send(size) && Send(piece) && Send("\r\n");
   }
 
-  bool Send(std::string bytes) {
-    const bool cut =
-        answer_.cut_after >= 0 && sent_ + bytes.size() > static_cast<size_t>(answer_.cut_after);
-    if (cut) {
-      bytes.resize(static_cast<size_t>(answer_.cut_after) - sent_);
-    }
-    const size_t step = answer_.slow_byte_ms > 0 ? 1 : std::max<size_t>(bytes.size(), 1);
-    for (size_t at = 0; at < bytes.size(); at += step) {
-      if (SSL_write(session_, bytes.data() + at, static_cast<int>(step)) <= 0) {
+  bool Send(std::string_view bytes) {
+    const size_t most = answer_.cut_after < 0 ? SIZE_MAX : static_cast<size_t>(answer_.cut_after);
+    const bool cut = bytes.size() > most - sent_;
+    bytes = bytes.substr(0, most - sent_);
+    sent_ += bytes.size();
+    const size_t step = answer_.slow_byte_ms > 0 ? 1 : bytes.size();
+    for (; !bytes.empty(); bytes.remove_prefix(step)) {
+      if (SSL_write(session_, bytes.data(), static_cast<int>(step)) <= 0) {
         return false;
       }
       Pause(answer_.slow_byte_ms);
     }
-    sent_ += bytes.size();
     return !cut;
   }
 
