@@ -6,6 +6,7 @@
 
 #include <cerrno>
 #include <cstdio>
+#include <utility>
 
 namespace quendel::test {
 
@@ -18,6 +19,15 @@ std::function<bool(size_t&)> FailsWith(int error) {
   return [error](size_t&) {
     errno = error;
     return false;
+  };
+}
+
+std::function<bool(size_t&)> Once(std::function<void()> action) {
+  return [action = std::move(action), done = false](size_t&) mutable {
+    if (!std::exchange(done, true)) {
+      action();
+    }
+    return true;
   };
 }
 

@@ -30,6 +30,9 @@ FileCalls& OnFileCalls();
 // A hook for a call that always fails with this errno.
 std::function<bool(size_t&)> FailsWith(int error);
 
+// A hook that does something at the first call and lets every call pass.
+std::function<bool(size_t&)> Once(std::function<void()> action);
+
 }  // namespace quendel::test
 
 #endif  // TESTS_COLLECTORS_FILE_CALLS_H_
