@@ -9,6 +9,7 @@
 #include <set>
 
 #include "support/journal.h"
+#include "support/own_work.h"
 #include "support/require.h"
 #include "support/wrap.h"
 
@@ -118,6 +119,7 @@ bool RegisterWrapped(const char* function) {
 }
 
 bool WrappedCall::Begin(const char* function) {
+  const OwnWork ownWork;
   const std::string name = (platformDepth > 0 ? kPlatformPrefix : "") + std::string(function);
   platform_ = IsPlatformOperation(function);
   platformDepth += platform_ ? 1 : 0;
@@ -140,6 +142,7 @@ WrappedCall::~WrappedCall() {
 }
 
 void WrappedCall::Keep(const std::string& text) {
+  const OwnWork ownWork;
   Records().Add(text);
 }
 

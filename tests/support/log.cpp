@@ -8,6 +8,7 @@
 #include <cstring>
 
 #include "support/journal.h"
+#include "support/own_work.h"
 #include "support/require.h"
 
 namespace quendel::test {
@@ -23,6 +24,7 @@ Journal& Lines() {
 
 // Each text starts with the priority and a blank.
 void Capture(int priority, const char* format, va_list arguments) {
+  const OwnWork ownWork;
   const int savedErrno = errno;
   va_list again;
   va_copy(again, arguments);
