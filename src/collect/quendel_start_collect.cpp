@@ -198,6 +198,14 @@ void WritePerformance(const Run& run, const Json::Value& perfSeries) {
   }
 }
 
+// The user-defined collectors' results are written after their state was staged. A child that was
+// killed in between has told nothing, and none of it may count as told.
+void DropUnwrittenResults(int status) {
+  if (WIFSIGNALED(status)) {
+    remove(kUdcUpdateFile);
+  }
+}
+
 // The limit counts the seconds slept.
 //
 // Deliberate: children that end during the last of them are too late. And any child of the process
@@ -205,12 +213,14 @@ void WritePerformance(const Run& run, const Json::Value& perfSeries) {
 bool WaitForChildren(Run& run, int limitSeconds) {
   int secondsWaited = 0;
   while (secondsWaited < limitSeconds) {
-    const pid_t ended = waitpid(-1, nullptr, WNOHANG);
+    int status = 0;
+    const pid_t ended = waitpid(-1, &status, WNOHANG);
     if (ended == 0) {
       ++secondsWaited;
       sleep(1);
     } else if (ended == run.udc.id) {
       run.udc.finished = true;
+      DropUnwrittenResults(status);
     } else if (ended == run.log.id) {
       run.log.finished = true;
     } else {

@@ -579,6 +579,30 @@ TEST(StartCollectTest, NeverCommitsWhatAnOlderRunStaged) {
   EXPECT_THAT(Log(), IsEmpty());
 }
 
+TEST(StartCollectTest, NeverCommitsResultsThatAKilledChildHadNoTimeToWrite) {
+  InstallCollectors();
+  const auto before = CollectorConf();
+  ReplaceCollector("udc", [](const char* directory) {
+    WriteFile(quendel::kUdcUpdateFile, "[/usr/arvo/etc/quendel/quendel.udc.raid]\nlast_hash=1\n");
+    return Die(directory);
+  });
+  ReplaceCollector("log", DoNothing);
+  EXPECT_EQ(Collect(), 0);
+  EXPECT_EQ(CollectorConf(), before);
+}
+
+TEST(StartCollectTest, CommitsTheLogsThatAKilledChildHadFinished) {
+  InstallCollectors();
+  ReplaceCollector("udc", DoNothing);
+  ReplaceCollector("log", [](const char* directory) {
+    WriteFile(quendel::kLogUpdateFile,
+              "[/usr/arvo/etc/quendel/quendel.log.messages]\ntotal_byte=6\n");
+    return Die(directory);
+  });
+  EXPECT_EQ(Collect(), 0);
+  EXPECT_THAT(ReadFile("/usr/arvo/etc/quendel/quendel.log.messages"), HasSubstr("total_byte=6\n"));
+}
+
 TEST(StartCollectTest, FailsWhenAChildOfTheCallerEndsMeanwhile) {
   InstallCollectors();
   const auto before = CollectorConf();
