@@ -20,6 +20,7 @@
 #include "quendel/conversation.h"
 #include "quendel/transport.h"
 #include "quendel/types.h"
+#include "quendel/upload.h"
 #include "quendel/version.h"
 
 #endif  // QUENDEL_H_

@@ -17,6 +17,17 @@ inline constexpr char kWorkRoot[] = "/tmp/quendel";
 inline constexpr char kLogUpdateFile[] = "/tmp/quendel/quendel.log.update.conf";
 inline constexpr char kUdcUpdateFile[] = "/tmp/quendel/quendel.udc.update.conf";
 
+// The directories in which requested files are prepared.
+inline constexpr char kDumpDir[] = "/tmp/quendel/coredump";
+inline constexpr char kDebugDir[] = "/tmp/quendel/debugdat";
+
+// A support session: what whoever opened it left to be undone, and the account's home.
+inline constexpr char kRemoteConfFile[] = "/usr/arvo/etc/quendel.remote.conf";
+inline constexpr char kSupportHome[] = "/run/quendelhome";
+inline constexpr char kSupportSshDir[] = "/run/quendelhome/.ssh";
+inline constexpr char kAuthorizedKeysName[] = "authorized_keys";
+inline constexpr char kAuthorizedKeysFile[] = "/run/quendelhome/.ssh/authorized_keys";
+
 }  // namespace quendel
 
 #endif  // BASE_PATHS_H_
