@@ -67,6 +67,10 @@ QUENDEL_WRAP(int, ALIBCopyRemoveDir, (const char* path), path);
 QUENDEL_WRAP(int, ARVOFileCopy, (const char* src, const char* dst, const void* options), src, dst,
              options);
 
+QUENDEL_WRAP(int, ARVOFSMkdirP,
+             (const char* path, int flag, int parents, int uid, int gid, unsigned int mode), path,
+             flag, parents, uid, gid, mode);
+
 QUENDEL_WRAP(int, ARVOZoneGet, (char* zone, int size, int* index), zone, size, index);
 QUENDEL_WRAP(int, ARVOZoneDesc, (const char* zone, char* desc, int size), zone, desc, size);
 
@@ -108,6 +112,7 @@ int __wrap_ALIBCExec(const char* program, const char* a1, const char* a2, const 
 QUENDEL_WRAP_BY_HAND(ALIBCExecl);
 int __real_ALIBCExecl(const char* program, int flags, ...);
 int __wrap_ALIBCExecl(const char* program, int flags, ...) {
+  quendel::test::Require(flags == 0xBB, "ALIBCExecl with other flags than ever");
   va_list arguments;
   va_start(arguments, flags);
   const CommandLine line = TakeCommandLine(program, arguments);
