@@ -1,0 +1,589 @@
+// The upload action.
+#include <gmock/gmock.h>
+#include <sys/stat.h>
+
+#include <cerrno>
+#include <string>
+
+#include "base/json_text.h"
+#include "quendel.h"
+#include "support/appliance.h"
+#include "support/faults.h"
+#include "support/json.h"
+#include "support/log.h"
+#include "support/server.h"
+
+using namespace quendel::test;
+using testing::ElementsAre;
+using testing::HasSubstr;
+using testing::IsEmpty;
+using testing::Not;
+using testing::SizeIs;
+
+namespace {
+
+constexpr char kUnit[] = "quendel_upload_file";
+constexpr char kDump[] = "/var/crash/@app.core";
+constexpr char kMoved[] = "/tmp/quendel/coredump/@app.core.xz";
+constexpr char kNoFile[] = "POST /action_progress/17/-3/a1/b2/S1 HTTP/1.1";
+constexpr char kUpload[] = "POST /upload_file/17/a1/b2/S1 HTTP/1.1";
+
+Json::Value File(const std::string& type, const std::string& path, const std::string& uuid = "u1") {
+  Json::Value file(Json::objectValue);
+  file["file_type"] = type;
+  file["file_path"] = path;
+  file["file_uuid"] = uuid;
+  return file;
+}
+
+Json::Value List(std::initializer_list<Json::Value> files) {
+  Json::Value list(Json::arrayValue);
+  for (const Json::Value& file : files) {
+    list.append(file);
+  }
+  return list;
+}
+
+// A device that is known to the server, with a dump on it and tools that work.
+class UploadFileTest : public testing::Test {
+ protected:
+  void SetUp() override {
+    SetIdentity();
+    WriteFile(kDump, "what the program held in memory");
+    Tool("/usr/arvo/bin/arvomsg_collector2", "echo facts > \"$1/facts.txt\"");
+    Tool("/usr/bin/zip", "while [ $# -gt 2 ]; do shift; done; tar -cf \"$1\" \"$2\" 2>/dev/null");
+    StartOver();
+  }
+
+  static void StartOver() {
+    ClearLog();
+    ResetCalls();
+    Record("ALIBCExec");
+    Record("ALIBCExecl");
+  }
+
+  static void Tool(const std::string& path, const std::string& script) {
+    RemoveFile(path);
+    WriteFile(path, "#!/bin/sh\n" + script + "\n");
+    chmod(path.c_str(), 0755);
+  }
+
+  static int Upload(const Json::Value& files) {
+    return QUENDELUploadFile(17, QUENDEL_ACT_PROGRESS_RUN, files);
+  }
+};
+
+using Step = testing::Matcher<LogLine>;
+
+Step GivenUp(const std::string& type, const std::string& path) {
+  return Logged(kUnit, "Prepare uploaded file failed [" + type + "]:[" + path + "]");
+}
+
+std::vector<std::string> RequestLines() {
+  std::vector<std::string> lines;
+  for (const Request& request : Requests()) {
+    lines.push_back(request.line);
+  }
+  return lines;
+}
+
+std::string Xz(const std::string& dump) {
+  return "/bin/xz|-kf|" + dump;
+}
+
+std::string Mv(const std::string& dump) {
+  return "/bin/mv|" + dump + ".xz|/tmp/quendel/coredump";
+}
+
+constexpr char kCollector[] = "/usr/arvo/bin/arvomsg_collector2|/tmp/quendel/debugdat";
+constexpr char kZip[] =
+    "/usr/bin/zip|-q|-9|-UN=UTF8|-E|-yf|-r|/tmp/quendel/debugdat.zip|/tmp/quendel/debugdat";
+constexpr char kRemoveDumps[] = "/bin/rm|-rf|/tmp/quendel/coredump";
+constexpr char kRemoveDebug[] = "/bin/rm|-rf|/tmp/quendel/debugdat";
+
+}  // namespace
+
+// ---- What is asked for.
+
+TEST_F(UploadFileTest, DoesNothingUnlessItIsToRun) {
+  const Json::Value hostile("not even a list");
+  for (const auto progress : {QUENDEL_ACT_PROGRESS_DONE, QUENDEL_ACT_PROGRESS_FAILED,
+                              QUENDEL_ACT_PROGRESS_NO_FILE, QuendelActionProgress_t(2)}) {
+    EXPECT_EQ(QUENDELUploadFile(17, progress, hostile), 0);
+  }
+  EXPECT_THAT(Log(), IsEmpty());
+  EXPECT_THAT(Recorded(), IsEmpty());
+  EXPECT_THAT(Requests(), IsEmpty());
+}
+
+TEST_F(UploadFileTest, TellsTheServerThatAnEmptyListHasNoFile) {
+  EXPECT_EQ(Upload(Json::Value(Json::arrayValue)), 0);
+  ASSERT_THAT(RequestLines(), ElementsAre(kNoFile));
+  EXPECT_EQ(Requests()[0].body, "{}");
+  EXPECT_THAT(Recorded(), IsEmpty());
+  EXPECT_THAT(Log(), IsEmpty());
+}
+
+TEST_F(UploadFileTest, TakesNullForAnEmptyList) {
+  EXPECT_EQ(Upload(Json::Value()), 0);
+  EXPECT_THAT(RequestLines(), ElementsAre(kNoFile));
+  EXPECT_THAT(Log(), IsEmpty());
+}
+
+TEST_F(UploadFileTest, RefusesAnythingElseThatIsNoList) {
+  for (const Json::Value& files :
+       {Json::Value("x"), Json::Value(12), Json::Value(1.5), Json::Value(true), Json::Value(""),
+        Json::Value(Json::objectValue), File("debug.dat", "")}) {
+    ClearLog();
+    EXPECT_EQ(Upload(files), -1) << quendel::JsonToText(files);
+    EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Invalid file path ''"),
+                                   Logged(kUnit, "Validate filepath failed")))
+        << quendel::JsonToText(files);
+  }
+  EXPECT_THAT(Requests(), IsEmpty());
+  EXPECT_THAT(Recorded(), IsEmpty());
+}
+
+TEST_F(UploadFileTest, RefusesElementsThatAreNoObjects) {
+  for (const Json::Value& element :
+       {Json::Value(), Json::Value("/var/crash/@x.core"), Json::Value(12), Json::Value(false),
+        Json::Value(Json::arrayValue), List({File("debug.dat", "")})}) {
+    ClearLog();
+    EXPECT_EQ(Upload(List({File("debug.dat", ""), element})), -1) << quendel::JsonToText(element);
+    EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Invalid file path ''"),
+                                   Logged(kUnit, "Validate filepath failed")))
+        << quendel::JsonToText(element);
+  }
+  EXPECT_THAT(Requests(), IsEmpty());
+  EXPECT_THAT(Recorded(), IsEmpty());
+}
+
+TEST_F(UploadFileTest, ReadsMembersOfOtherKindsAsText) {
+  for (const Json::Value& path : {Json::Value(), Json::Value(Json::arrayValue),
+                                  Json::Value(Json::objectValue), Json::Value("")}) {
+    ClearLog();
+    Json::Value file = File("coredump", "");
+    file["file_path"] = path;
+    EXPECT_EQ(Upload(List({file})), -1);
+    EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Invalid file path ''"),
+                                   Logged(kUnit, "Validate filepath failed")));
+  }
+  ClearLog();
+  Json::Value number = File("coredump", "");
+  number["file_path"] = 12;
+  EXPECT_EQ(Upload(List({number})), -1);
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Invalid file path '12'"),
+                                 Logged(kUnit, "Validate filepath failed")));
+}
+
+TEST_F(UploadFileTest, DropsATypeOfAnotherKind) {
+  Json::Value file = File("", kDump);
+  file["file_type"] = List({File("debug.dat", "")});
+  EXPECT_EQ(Upload(List({file})), 0);
+  EXPECT_THAT(
+      Log(), ElementsAre(Logged(kUnit, "Get unknown upload file type: \"\"."), GivenUp("", kDump)));
+  EXPECT_THAT(RequestLines(), ElementsAre(kNoFile));
+}
+
+TEST_F(UploadFileTest, DropsAMissingTypeWhosePathIsValid) {
+  Json::Value file = File("", kDump);
+  file.removeMember("file_type");
+  EXPECT_EQ(Upload(List({file})), 0);
+  EXPECT_THAT(
+      Log(), ElementsAre(Logged(kUnit, "Get unknown upload file type: \"\"."), GivenUp("", kDump)));
+}
+
+TEST_F(UploadFileTest, RefusesAMissingTypeWhosePathIsNot) {
+  Json::Value file = File("", "/etc/shadow");
+  file.removeMember("file_type");
+  EXPECT_EQ(Upload(List({file})), -1);
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Invalid file path '/etc/shadow'"),
+                                 Logged(kUnit, "Validate filepath failed")));
+}
+
+TEST_F(UploadFileTest, AcceptsPathsThatMatchThePattern) {
+  for (const std::string path :
+       {"/var/crash/@x.core", "/volume12/@a/b.core", "/volume0/@.core.core", "/volume1/@a\nb.core",
+        "/volume1/@a/../b.core", "/volume1/@ .core", "/volume1/@-rf.core"}) {
+    ClearLog();
+    EXPECT_EQ(Upload(List({File("coredump", path)})), 0) << path;
+    // It got as far as xz, which does not find such a dump.
+    EXPECT_THAT(Log(),
+                ElementsAre(Logged(kUnit, "Fail to compress coredump"), GivenUp("coredump", path)));
+  }
+}
+
+TEST_F(UploadFileTest, RefusesPathsThatDoNot) {
+  for (const std::string path :
+       {"/var/crash/x.core", "/volume/@x.core", "/volume1/@x.core.gz", "/tmp/@x.core",
+        "/var/crash/@.core", "/volume1/a/@x.core", "/var/crash//@x.core", "/var/crash/@x.core\n",
+        "\n/var/crash/@x.core", " /var/crash/@x.core", "var/crash/@x.core", "/volume1/@xcore",
+        "/volume1/@xxcore", "/VAR/crash/@x.core", "/etc/passwd\n/var/crash/@x.core",
+        "../var/crash/@x.core", "@x.core"}) {
+    ClearLog();
+    EXPECT_EQ(Upload(List({File("coredump", path)})), -1) << path;
+    EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Invalid file path '" + path + "'"),
+                                   Logged(kUnit, "Validate filepath failed")));
+  }
+  EXPECT_THAT(Requests(), IsEmpty());
+  EXPECT_THAT(Recorded(), IsEmpty());
+}
+
+TEST_F(UploadFileTest, OneInvalidPathFailsTheWholeRequest) {
+  EXPECT_EQ(Upload(List({File("debug.dat", ""), File("coredump", kDump),
+                         File("coredump", "/etc/shadow"), File("coredump", "/etc/passwd")})),
+            -1);
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Invalid file path '/etc/shadow'"),
+                                 Logged(kUnit, "Validate filepath failed")));
+  EXPECT_THAT(Recorded(), IsEmpty());
+}
+
+TEST_F(UploadFileTest, ChecksThePathOfUnknownTypesToo) {
+  EXPECT_EQ(Upload(List({File("core", "/etc/shadow")})), -1);
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Invalid file path '/etc/shadow'"),
+                                 Logged(kUnit, "Validate filepath failed")));
+}
+
+TEST_F(UploadFileTest, PutsAPathThatEndsAtANulToUseUpToThere) {
+  const std::string path("/var/crash/@app.core\0/../../etc/shadow", 37);
+  EXPECT_EQ(Upload(List({File("coredump", path)})), 0);
+  EXPECT_THAT(Recorded(), ElementsAre(Xz(kDump), Mv(kDump), kRemoveDumps));
+  EXPECT_THAT(RequestLines(), ElementsAre(kUpload));
+}
+
+TEST_F(UploadFileTest, RefusesAPathThatMatchesOnlyBehindANul) {
+  EXPECT_EQ(Upload(List({File("coredump", std::string("/etc/shadow\0@x.core", 19))})), -1);
+  EXPECT_EQ(Upload(List({File("coredump", std::string("\0/var/crash/@x.core", 19))})), -1);
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Invalid file path '/etc/shadow'"),
+                                 Logged(kUnit, "Validate filepath failed"),
+                                 Logged(kUnit, "Invalid file path ''"),
+                                 Logged(kUnit, "Validate filepath failed")));
+}
+
+TEST_F(UploadFileTest, DebugTypeMustBeExact) {
+  for (const std::string& type : {std::string("debug.dat\0", 10), std::string("DEBUG.DAT"),
+                                  std::string("debug.dat "), std::string("debugxdat")}) {
+    ClearLog();
+    EXPECT_EQ(Upload(List({File(type, "")})), -1);
+    EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Invalid file path ''"),
+                                   Logged(kUnit, "Validate filepath failed")));
+  }
+}
+
+TEST_F(UploadFileTest, BearsAPathOfOneMebibyte) {
+  const std::string longPath = "/volume1/@" + std::string(1 << 20, 'a') + ".core";
+  EXPECT_EQ(Upload(List({File("coredump", longPath)})), 0);
+  EXPECT_THAT(Log(), ElementsAre(GivenUp("coredump", longPath)));
+  EXPECT_THAT(Recorded(), ElementsAre(kRemoveDumps));
+  ClearLog();
+  EXPECT_EQ(Upload(List({File("coredump", longPath + "x")})), -1);
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Invalid file path '" + longPath + "x'"),
+                                 Logged(kUnit, "Validate filepath failed")));
+}
+
+// ---- How many.
+
+TEST_F(UploadFileTest, RefusesMoreThanFive) {
+  Json::Value files(Json::arrayValue);
+  for (int i = 0; i < 6; ++i) {
+    files.append(File("debug.dat", ""));
+  }
+  EXPECT_EQ(Upload(files), -1);
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Upload files exceed the max limit")));
+  EXPECT_THAT(Requests(), IsEmpty());
+  EXPECT_THAT(Recorded(), IsEmpty());
+}
+
+TEST_F(UploadFileTest, RefusesTenThousand) {
+  Json::Value files(Json::arrayValue);
+  for (int i = 0; i < 10000; ++i) {
+    files.append(File("coredump", kDump));
+  }
+  EXPECT_EQ(Upload(files), -1);
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Upload files exceed the max limit")));
+}
+
+TEST_F(UploadFileTest, ChecksThePathsBeforeTheLimit) {
+  Json::Value files(Json::arrayValue);
+  for (int i = 0; i < 5; ++i) {
+    files.append(File("coredump", kDump));
+  }
+  files.append(File("coredump", "/etc/shadow"));
+  EXPECT_EQ(Upload(files), -1);
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Invalid file path '/etc/shadow'"),
+                                 Logged(kUnit, "Validate filepath failed")));
+}
+
+TEST_F(UploadFileTest, AcceptsFive) {
+  Json::Value files(Json::arrayValue);
+  for (int i = 0; i < 5; ++i) {
+    const std::string dump = "/volume1/@d/" + std::to_string(i) + ".core";
+    WriteFile(dump, "dump");
+    files.append(File("coredump", dump));
+  }
+  EXPECT_EQ(Upload(files), 0);
+  EXPECT_THAT(Log(), IsEmpty());
+  EXPECT_THAT(RequestLines(), ElementsAre(kUpload));
+}
+
+// ---- A crash dump.
+
+TEST_F(UploadFileTest, SendsADumpCompressedAndKeepsIt) {
+  EXPECT_EQ(Upload(List({File("coredump", kDump, "u7")})), 0);
+  EXPECT_THAT(Log(), IsEmpty());
+  EXPECT_THAT(Recorded(), ElementsAre(Xz(kDump), Mv(kDump), kRemoveDumps));
+  ASSERT_THAT(RequestLines(), ElementsAre(kUpload));
+  const std::string body = Requests()[0].body;
+  EXPECT_THAT(body, HasSubstr("\xFD"
+                              "7zXZ"));
+  EXPECT_THAT(body, HasSubstr("\"filename\":\"@app.core.xz\""));
+  EXPECT_THAT(body, HasSubstr("\"type\":\"coredump\""));
+  EXPECT_THAT(body, HasSubstr("\"fileuuid\":\"u7\""));
+  EXPECT_EQ(ReadFile(kDump), "what the program held in memory");
+  EXPECT_FALSE(Exists(std::string(kDump) + ".xz"));
+  EXPECT_FALSE(Exists("/tmp/quendel/coredump"));
+}
+
+TEST_F(UploadFileTest, MakesItsDirectoriesForItselfAlone) {
+  ResetCalls();
+  Record("ARVOFSMkdirP");
+  EXPECT_EQ(Upload(List({File("coredump", kDump), File("debug.dat", "")})), 0);
+  EXPECT_THAT(Recorded(), ElementsAre("/tmp/quendel/coredump|0|1|-1|-1|448",
+                                      "/tmp/quendel/debugdat|0|1|-1|-1|448"));
+}
+
+TEST_F(UploadFileTest, TakesTheTimeBeforeItPreparesAFile) {
+  Record("time");  // without arguments, so that its record is empty
+  EXPECT_EQ(Upload(List({File("coredump", kDump)})), 0);
+  EXPECT_THAT(Recorded(), ElementsAre("", Xz(kDump), Mv(kDump), kRemoveDumps));
+}
+
+TEST_F(UploadFileTest, TakesTheTimeOfEachFile) {
+  FailCall("time", 1, 1700000001);
+  FailCall("time", 2, 1700000002);
+  EXPECT_EQ(Upload(List({File("coredump", kDump), File("coredump", kDump)})), 0);
+  ASSERT_THAT(Requests(), SizeIs(1));
+  EXPECT_THAT(Requests()[0].body, HasSubstr("\"timestamp\":\"1700000001\""));
+  EXPECT_THAT(Requests()[0].body, HasSubstr("\"timestamp\":\"1700000002\""));
+}
+
+TEST_F(UploadFileTest, GivesADumpUpWithoutItsDirectory) {
+  FailCall("ARVOFSMkdirP", 1, -1);
+  EXPECT_EQ(Upload(List({File("coredump", kDump)})), 0);
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Fail to ARVOFSMkdirP for '/tmp/quendel/coredump'"),
+                                 GivenUp("coredump", kDump)));
+  EXPECT_THAT(Recorded(), IsEmpty());
+  EXPECT_THAT(RequestLines(), ElementsAre(kNoFile));
+}
+
+TEST_F(UploadFileTest, GivesADumpUpThatCannotBeCompressed) {
+  for (const long status : {1L, -1L, 137L}) {
+    StartOver();
+    FailCall("ALIBCExec", 1, status);
+    EXPECT_EQ(Upload(List({File("coredump", kDump)})), 0);
+    EXPECT_THAT(
+        Log(), ElementsAre(Logged(kUnit, "Fail to compress coredump"), GivenUp("coredump", kDump)));
+    EXPECT_THAT(Recorded(), ElementsAre(Xz(kDump), kRemoveDumps));
+  }
+  EXPECT_THAT(RequestLines(), ElementsAre(kNoFile, kNoFile, kNoFile));
+}
+
+TEST_F(UploadFileTest, TakesTheCopyAwayThatCannotBeMoved) {
+  for (const long status : {1L, -1L}) {
+    StartOver();
+    FailCall("ALIBCExec", 2, status);
+    EXPECT_EQ(Upload(List({File("coredump", kDump)})), 0);
+    EXPECT_THAT(Log(),
+                ElementsAre(Logged(kUnit, "Fail to move coredump"), GivenUp("coredump", kDump)));
+    EXPECT_THAT(Recorded(), ElementsAre(Xz(kDump), Mv(kDump), "/bin/rm|-rf|/var/crash/@app.core.xz",
+                                        kRemoveDumps));
+    EXPECT_FALSE(Exists(std::string(kDump) + ".xz"));
+    EXPECT_TRUE(Exists(kDump));
+  }
+}
+
+TEST_F(UploadFileTest, TellsOfACopyThatCannotBeTakenAway) {
+  FailCall("ALIBCExec", 2, 1);
+  FailCall("ALIBCExecl", 1, -1);
+  EXPECT_EQ(Upload(List({File("coredump", kDump)})), 0);
+  EXPECT_THAT(Log(),
+              ElementsAre(Logged(kUnit, "Fail to move coredump"),
+                          Logged(kUnit, "Fail to remove temp log zip [/var/crash/@app.core.xz]"),
+                          GivenUp("coredump", kDump)));
+}
+
+TEST_F(UploadFileTest, LooksOnlyWhetherTheRemovalOfACopyCouldRun) {
+  FailCall("ALIBCExec", 2, 1);
+  FailCall("ALIBCExecl", 1, 1);
+  EXPECT_EQ(Upload(List({File("coredump", kDump)})), 0);
+  EXPECT_THAT(Log(),
+              ElementsAre(Logged(kUnit, "Fail to move coredump"), GivenUp("coredump", kDump)));
+}
+
+// With its ".xz" a path of 1,020 bytes is the longest that the buffer of 1,024 holds whole.
+TEST_F(UploadFileTest, GivesADumpUpWhosePathFillsTheBuffer) {
+  for (const size_t length : {1020U, 1021U, 1023U, 1024U, 4000U}) {
+    StartOver();
+    std::string path = "/volume1/@d";
+    while (path.size() < length - 205) {
+      path += "/" + std::string(99, 'd');
+    }
+    path += "/";
+    WriteFile(path + "keep", "");
+    path += std::string(length - path.size() - 5, 'x') + ".core";
+    ASSERT_EQ(path.size(), length);
+    WriteFile(path, "dump");
+    EXPECT_EQ(Upload(List({File("coredump", path)})), 0);
+    if (length <= 1020) {
+      EXPECT_THAT(Log(), IsEmpty());
+      EXPECT_THAT(Recorded(), ElementsAre(Xz(path), Mv(path), kRemoveDumps));
+    } else {
+      EXPECT_THAT(Log(), ElementsAre(GivenUp("coredump", path))) << length;
+      EXPECT_THAT(Recorded(), ElementsAre(kRemoveDumps));
+    }
+    EXPECT_EQ(ReadFile(path), "dump");
+    EXPECT_FALSE(Exists(path + ".xz"));
+  }
+}
+
+// ---- The debug archive.
+
+TEST_F(UploadFileTest, CollectsAndSendsTheDebugArchive) {
+  EXPECT_EQ(Upload(List({File("debug.dat", "/etc/shadow", "u8")})), 0);
+  EXPECT_THAT(Log(), IsEmpty());
+  EXPECT_THAT(Recorded(), ElementsAre(kCollector, kZip, kRemoveDebug));
+  ASSERT_THAT(RequestLines(), ElementsAre(kUpload));
+  EXPECT_THAT(Requests()[0].body, HasSubstr("\"filename\":\"debugdat.zip\""));
+  EXPECT_THAT(Requests()[0].body, HasSubstr("\"type\":\"debug.dat\""));
+  EXPECT_THAT(Requests()[0].body, HasSubstr("\"fileuuid\":\"u8\""));
+  EXPECT_THAT(Requests()[0].body, HasSubstr("facts"));
+  EXPECT_FALSE(Exists("/tmp/quendel/debugdat"));
+  EXPECT_TRUE(Exists("/tmp/quendel/debugdat.zip"));  // outside the directory, so it stays
+}
+
+TEST_F(UploadFileTest, GivesTheDebugArchiveUpWithoutItsDirectory) {
+  FailCall("ARVOFSMkdirP", 1, -1);
+  EXPECT_EQ(Upload(List({File("debug.dat", "p")})), 0);
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Fail to ARVOFSMkdirP for '/tmp/quendel/debugdat'"),
+                                 GivenUp("debug.dat", "p")));
+  EXPECT_THAT(Recorded(), IsEmpty());
+  EXPECT_THAT(RequestLines(), ElementsAre(kNoFile));
+}
+
+TEST_F(UploadFileTest, GivesTheDebugArchiveUpWhenNothingCouldBeCollected) {
+  for (const long status : {1L, -1L}) {
+    StartOver();
+    FailCall("ALIBCExec", 1, status);
+    EXPECT_EQ(Upload(List({File("debug.dat", "p")})), 0);
+    EXPECT_THAT(Log(),
+                ElementsAre(Logged(kUnit,
+                                   "Fail to do log collector /usr/arvo/bin/arvomsg_collector2 "
+                                   "/tmp/quendel/debugdat"),
+                            GivenUp("debug.dat", "p")));
+    EXPECT_THAT(Recorded(), ElementsAre(kCollector, kRemoveDebug));
+  }
+}
+
+TEST_F(UploadFileTest, GivesTheDebugArchiveUpThatCouldNotBePacked) {
+  FailCall("ALIBCExecl", 1, -1);
+  EXPECT_EQ(Upload(List({File("debug.dat", "p")})), 0);
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Fail to zip attachment /tmp/quendel/debugdat.zip"),
+                                 GivenUp("debug.dat", "p")));
+  EXPECT_THAT(Recorded(), ElementsAre(kCollector, kZip, kRemoveDebug));
+  EXPECT_FALSE(Exists("/tmp/quendel/debugdat"));
+}
+
+TEST_F(UploadFileTest, LooksOnlyWhetherThePackingCouldRun) {
+  Tool("/usr/bin/zip", "echo half > /tmp/quendel/debugdat.zip; exit 18");
+  EXPECT_EQ(Upload(List({File("debug.dat", "")})), 0);
+  EXPECT_THAT(Log(), IsEmpty());
+  ASSERT_THAT(RequestLines(), ElementsAre(kUpload));
+  EXPECT_THAT(Requests()[0].body, HasSubstr("half"));
+}
+
+// ---- Several files.
+
+TEST_F(UploadFileTest, SendsAllFilesInOnePostInTheirOrder) {
+  WriteFile("/volume2/@two.core", "two");
+  EXPECT_EQ(Upload(List({File("coredump", kDump, "first"), File("debug.dat", "", "second"),
+                         File("coredump", "/volume2/@two.core", "third")})),
+            0);
+  ASSERT_THAT(RequestLines(), ElementsAre(kUpload));
+  const std::string body = Requests()[0].body;
+  const size_t first = body.find("\"fileuuid\":\"first\"");
+  const size_t second = body.find("\"fileuuid\":\"second\"");
+  const size_t third = body.find("\"fileuuid\":\"third\"");
+  EXPECT_NE(third, std::string::npos);
+  EXPECT_LT(first, second);
+  EXPECT_LT(second, third);
+  EXPECT_THAT(Log(), IsEmpty());
+}
+
+TEST_F(UploadFileTest, OneFailedFileDoesNotStopTheOthers) {
+  EXPECT_EQ(Upload(List({File("coredump", "/var/crash/@gone.core"), File("core", kDump),
+                         File("coredump", kDump, "found")})),
+            0);
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Fail to compress coredump"),
+                                 GivenUp("coredump", "/var/crash/@gone.core"),
+                                 Logged(kUnit, "Get unknown upload file type: \"core\"."),
+                                 GivenUp("core", kDump)));
+  ASSERT_THAT(RequestLines(), ElementsAre(kUpload));
+  EXPECT_THAT(Requests()[0].body, HasSubstr("\"fileuuid\":\"found\""));
+  EXPECT_THAT(Requests()[0].body, Not(HasSubstr("gone")));
+}
+
+TEST_F(UploadFileTest, RemovesOnlyTheDirectoryOfTheKindPreparedLast) {
+  EXPECT_EQ(Upload(List({File("coredump", kDump), File("debug.dat", "")})), 0);
+  EXPECT_THAT(Recorded(), ElementsAre(Xz(kDump), Mv(kDump), kCollector, kZip, kRemoveDebug));
+  EXPECT_TRUE(Exists(kMoved));
+  EXPECT_FALSE(Exists("/tmp/quendel/debugdat"));
+
+  EXPECT_EQ(Upload(List({File("debug.dat", ""), File("coredump", kDump)})), 0);
+  EXPECT_FALSE(Exists("/tmp/quendel/coredump"));
+  EXPECT_TRUE(Exists("/tmp/quendel/debugdat"));
+}
+
+TEST_F(UploadFileTest, AFileGivenUpStillDecidesWhichDirectoryGoes) {
+  EXPECT_EQ(Upload(List({File("debug.dat", ""), File("coredump", "/var/crash/@gone.core")})), 0);
+  EXPECT_FALSE(Exists("/tmp/quendel/coredump"));
+  EXPECT_TRUE(Exists("/tmp/quendel/debugdat"));
+}
+
+// ---- What becomes of it.
+
+TEST_F(UploadFileTest, FailsWhenTheServerRefusesTheFiles) {
+  Answer({.body = R"({"success":false,"code":111000})"});
+  EXPECT_EQ(Upload(List({File("coredump", kDump)})), -1);
+  EXPECT_EQ(Log().back().message, "Send collect data fail");
+  EXPECT_EQ(Log().back().unit, kUnit);
+  EXPECT_FALSE(Exists("/tmp/quendel/coredump"));
+  EXPECT_THAT(RequestLines(), ElementsAre(kUpload));
+}
+
+TEST_F(UploadFileTest, FailsWhenTheServerCannotBeToldThatThereIsNoFile) {
+  Answer({.body = R"({"success":false})"});
+  EXPECT_EQ(Upload(List({File("coredump", "/var/crash/@gone.core")})), -1);
+  EXPECT_EQ(Log().back().message, "Failed to update progress to server");
+  EXPECT_EQ(Log().back().unit, kUnit);
+  EXPECT_FALSE(Exists("/tmp/quendel/coredump"));
+}
+
+TEST_F(UploadFileTest, TellsOfADirectoryThatCannotBeRemoved) {
+  FailCall("ALIBCExecl", 1, -1);
+  EXPECT_EQ(Upload(List({File("coredump", kDump)})), 0);
+  EXPECT_THAT(Log(),
+              ElementsAre(Logged(kUnit, "Fail to remove temp logs [/tmp/quendel/coredump]")));
+}
+
+TEST_F(UploadFileTest, LooksOnlyWhetherTheRemovalCouldRun) {
+  FailCall("ALIBCExecl", 1, 1);
+  EXPECT_EQ(Upload(List({File("coredump", kDump)})), 0);
+  EXPECT_THAT(Log(), IsEmpty());
+}
+
+TEST_F(UploadFileTest, RemovalThatFailsDoesNotChangeTheResult) {
+  FailCall("ALIBCExecl", 1, -1);
+  Answer({.status = 500, .body = "oops"});
+  EXPECT_EQ(Upload(List({File("coredump", kDump)})), -1);
+  EXPECT_EQ(Log().back().message, "Fail to remove temp logs [/tmp/quendel/coredump]");
+}
