@@ -9,7 +9,9 @@
 #include "support/faults.h"
 #include "support/json.h"
 #include "support/log.h"
+#include "support/replies.h"
 #include "support/server.h"
+#include "transport/multipart.h"
 
 using namespace quendel::test;
 using testing::_;
@@ -40,18 +42,7 @@ std::string RequestLine() {
 
 // What the last part of the only request so far says of the files.
 Json::Value Descriptions() {
-  const std::string body = Requests().at(0).body;
-  const size_t part = body.rfind("name=\"upload_list\"");
-  const size_t begin = body.find("\r\n\r\n", part) + 4;
-  return JsonOf(body.substr(begin, body.find("\r\n--", begin) - begin));
-}
-
-size_t Count(const std::string& text, const std::string& piece) {
-  size_t count = 0;
-  for (size_t at = text.find(piece); at != std::string::npos; at = text.find(piece, at + 1)) {
-    ++count;
-  }
-  return count;
+  return JsonOf(Parts(Requests().at(0)).back().body);
 }
 
 }  // namespace
@@ -64,9 +55,12 @@ TEST(SendUploadDataTest, PostsFilesAndDescriptionsUnderOneName) {
                                        Item("/tmp/two.zip", 1700000009, "debug.dat", "u2")}),
             0);
   EXPECT_EQ(RequestLine(), "POST /upload_file/17/a1/b2/S1 HTTP/1.1");
-  const std::string body = Requests()[0].body;
-  EXPECT_EQ(Count(body, "form-data; name=\"upload_list\""), 3U);
-  EXPECT_LT(body.find("first file"), body.find("second file"));
+  const std::vector<Part> parts = Parts(Requests()[0]);
+  const std::string binary = "application/octet-stream";
+  ASSERT_THAT(parts, SizeIs(3));
+  EXPECT_EQ(parts[0], FilePart("upload_list", "one.xz", binary, "first file"));
+  EXPECT_EQ(parts[1], FilePart("upload_list", "two.zip", binary, "second file"));
+  EXPECT_EQ(parts[2], TextPart("upload_list", parts[2].body));
   EXPECT_EQ(Descriptions(), JsonOf(R"([
     {"filename":"one.xz","type":"coredump","fileuuid":"u1","timestamp":"1700000000"},
     {"filename":"two.zip","type":"debug.dat","fileuuid":"u2","timestamp":"1700000009"}])"));
@@ -77,7 +71,7 @@ TEST(SendUploadDataTest, PostsAnEmptyListToo) {
   SetIdentity();
   EXPECT_EQ(QUENDELSendUploadData(17, {}), 0);
   EXPECT_EQ(RequestLine(), "POST /upload_file/17/a1/b2/S1 HTTP/1.1");
-  EXPECT_EQ(Descriptions(), JsonOf("[]"));
+  EXPECT_THAT(Parts(Requests()[0]), ElementsAre(TextPart("upload_list", "[]")));
 }
 
 TEST(SendUploadDataTest, WritesTheTimestampAsText) {
@@ -169,4 +163,19 @@ TEST(SendUploadDataTest, FailsWhenThePostDoesNotGetThrough) {
   EXPECT_EQ(QUENDELSendUploadData(17, {}), -1);
   EXPECT_THAT(Log(), ElementsAre(Logged("quendel_post_file_to_server", _),
                                  Logged(kUnit, "Failed to post file to server")));
+}
+
+TEST(SendUploadDataTest, GoesByWhatEachHostileReplySays) {
+  SetIdentity();
+  for (const HostileReply& reply : HostileReplies()) {
+    SCOPED_TRACE(reply.name);
+    ClearLog();
+    Answer(reply.answer);
+    EXPECT_EQ(QUENDELSendUploadData(17, {}), reply.success ? 0 : -1);
+    if (reply.success) {
+      EXPECT_THAT(Log(), IsEmpty());
+    } else {
+      EXPECT_THAT(Log().back(), Logged(kUnit, "Failed to post file to server"));
+    }
+  }
 }

@@ -1,0 +1,274 @@
+// The support account: its home, its key, its end.
+#include <gmock/gmock.h>
+#include <pwd.h>
+#include <sys/resource.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+
+#include "quendel.h"
+#include "support/appliance.h"
+#include "support/faults.h"
+#include "support/log.h"
+
+using namespace quendel::test;
+using testing::ElementsAre;
+using testing::IsEmpty;
+
+namespace {
+
+constexpr char kUnit[] = "quendel_support_account_user";
+constexpr char kHome[] = "/run/quendelhome";
+constexpr char kSshDir[] = "/run/quendelhome/.ssh";
+constexpr char kKeyFile[] = "/run/quendelhome/.ssh/authorized_keys";
+constexpr char kKey[] = "ssh-ed25519 AAAAC3Nza support@vendor";
+
+struct stat Status(const char* path) {
+  struct stat status = {};
+  EXPECT_EQ(lstat(path, &status), 0) << path;
+  return status;
+}
+
+unsigned int Mode(const char* path) {
+  return Status(path).st_mode & 07777U;
+}
+
+bool HasAccount(const char* name) {
+  setpwent();  // read the file anew
+  return getpwnam(name) != nullptr;
+}
+
+void MakeSshDir() {
+  ASSERT_EQ(mkdir(kHome, 0755), 0);
+  ASSERT_EQ(mkdir(kSshDir, 0755), 0);
+}
+
+}  // namespace
+
+// ---- Creating it.
+
+TEST(SupportAccountUserCreateTest, PreparesHomeAccountAndKey) {
+  umask(022);
+  EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), 0);
+  EXPECT_THAT(Log(), IsEmpty());
+  EXPECT_EQ(Status(kHome).st_uid, 50001U);
+  EXPECT_EQ(Status(kHome).st_gid, 100U);
+  EXPECT_EQ(Status(kSshDir).st_uid, 0U);  // the home alone changes hands
+  EXPECT_EQ(Status(kKeyFile).st_uid, 0U);
+  EXPECT_EQ(Mode(kSshDir), 0755U);
+  EXPECT_EQ(Mode(kKeyFile), 0644U);
+  EXPECT_EQ(ReadFile(kKeyFile), kKey);  // no line end is added
+  EXPECT_TRUE(HasAccount("support"));
+}
+
+TEST(SupportAccountUserCreateTest, KeyIsReadableWhateverTheUmask) {
+  umask(077);
+  EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), 0);
+  EXPECT_EQ(Mode(kKeyFile), 0644U);
+}
+
+TEST(SupportAccountUserCreateTest, MakesTheSshDirOnlyWhenItIsMissing) {
+  Record("ALIBCExec");
+  EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), 0);
+  EXPECT_THAT(Recorded(), ElementsAre("/bin/mkdir|-p|/run/quendelhome/.ssh|-m|755"));
+  EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), 0);
+  EXPECT_EQ(Recorded().size(), 1U);
+}
+
+TEST(SupportAccountUserCreateTest, SetsTheOwnerOfAHomeThatIsThere) {
+  MakeSshDir();
+  EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), 0);
+  EXPECT_EQ(Status(kHome).st_uid, 50001U);
+  ASSERT_EQ(chown(kHome, 0, 0), 0);
+  EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), 0);
+  EXPECT_EQ(Status(kHome).st_uid, 50001U);
+}
+
+TEST(SupportAccountUserCreateTest, ReplacesTheKey) {
+  EXPECT_EQ(QUENDELSupportAccountUserCreate("support", "a key that is longer\n"), 0);
+  EXPECT_EQ(QUENDELSupportAccountUserCreate("support", "shorter\n"), 0);
+  EXPECT_EQ(ReadFile(kKeyFile), "shorter\n");
+}
+
+TEST(SupportAccountUserCreateTest, WritesAnEmptyKey) {
+  EXPECT_EQ(QUENDELSupportAccountUserCreate("support", ""), 0);
+  EXPECT_TRUE(Exists(kKeyFile));
+  EXPECT_EQ(ReadFile(kKeyFile), "");
+  EXPECT_THAT(Log(), IsEmpty());
+}
+
+TEST(SupportAccountUserCreateTest, FailsWhenMkdirCannotRun) {
+  FailCall("ALIBCExec", 1, -1, ENOENT);
+  EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), -1);
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to mkdir '/run/quendelhome/.ssh'\n")));
+  EXPECT_EQ(Calls("ARVOLocalAccountUserPrepareForQuendel"), 0);
+}
+
+TEST(SupportAccountUserCreateTest, PassesOverADirThatSomeoneElseMadeMeanwhile) {
+  MakeSshDir();
+  FailCall("ALIBCFileCheckDir", 1, 0);
+  FailCall("ALIBCExec", 1, -1, EEXIST);
+  EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), 0);
+  EXPECT_THAT(Log(), IsEmpty());
+}
+
+TEST(SupportAccountUserCreateTest, GoesOnWhenItCannotTellWhetherTheDirIsThere) {
+  MakeSshDir();
+  FailCall("ALIBCFileCheckDir", 1, -1);
+  EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), 0);
+  EXPECT_EQ(Calls("ALIBCExec"), 0);
+}
+
+TEST(SupportAccountUserCreateTest, FailsWhenTheHomeCannotChangeHands) {
+  FailCall("chown", 1, -1, EPERM);
+  EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), -1);
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to chown '/run/quendelhome'")));
+  EXPECT_FALSE(HasAccount("support"));
+}
+
+TEST(SupportAccountUserCreateTest, FailsWhenMkdirRanButMadeNothing) {
+  FailCall("ALIBCExec", 1, 1);  // its exit status is nobody's concern; the home is missing
+  EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), -1);
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to chown '/run/quendelhome'")));
+}
+
+TEST(SupportAccountUserCreateTest, FailsWhenTheAccountCannotBePrepared) {
+  FailCall("ARVOLocalAccountUserPrepareForQuendel", 1, -1);
+  EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), -1);
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to prepare local account 'support'")));
+  EXPECT_FALSE(Exists(kKeyFile));
+}
+
+TEST(SupportAccountUserCreateTest, FailsWhenTheKeyFileCannotBeOpened) {
+  MakeSshDir();
+  ASSERT_EQ(mkdir(kKeyFile, 0755), 0);
+  EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), -1);
+  EXPECT_THAT(Log(),
+              ElementsAre(Logged(kUnit, "Failed to open '/run/quendelhome/.ssh/authorized_keys'")));
+}
+
+TEST(SupportAccountUserCreateTest, FollowsNoLinkInPlaceOfTheKeyFile) {
+  MakeSshDir();
+  WriteFile("/tmp/shadow", "theirs");
+  ASSERT_EQ(symlink("/tmp/shadow", kKeyFile), 0);
+  EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), -1);
+  EXPECT_THAT(Log(),
+              ElementsAre(Logged(kUnit, "Failed to open '/run/quendelhome/.ssh/authorized_keys'")));
+  EXPECT_EQ(ReadFile("/tmp/shadow"), "theirs");
+}
+
+TEST(SupportAccountUserCreateTest, FollowsNoLinkInPlaceOfTheSshDir) {
+  ASSERT_EQ(mkdir(kHome, 0755), 0);
+  ASSERT_EQ(mkdir("/tmp/elsewhere", 0755), 0);
+  ASSERT_EQ(symlink("/tmp/elsewhere", kSshDir), 0);
+  EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), -1);
+  EXPECT_THAT(Log(),
+              ElementsAre(Logged(kUnit, "Failed to open '/run/quendelhome/.ssh/authorized_keys'")));
+  EXPECT_FALSE(Exists("/tmp/elsewhere/authorized_keys"));
+}
+
+TEST(SupportAccountUserCreateTest, DoesNotWaitForTheReaderOfAFifo) {
+  MakeSshDir();
+  ASSERT_EQ(mkfifo(kKeyFile, 0644), 0);
+  EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), -1);
+  EXPECT_THAT(Log(),
+              ElementsAre(Logged(kUnit, "Failed to open '/run/quendelhome/.ssh/authorized_keys'")));
+}
+
+TEST(SupportAccountUserCreateTest, FailsWhenTheKeyCannotBeWritten) {
+  MakeSshDir();
+  // A file may not grow at all, as on a full disk.
+  signal(SIGXFSZ, SIG_IGN);
+  FailCall("ARVOLocalAccountUserPrepareForQuendel", 1, 0);
+  const rlimit none = {0, RLIM_INFINITY};
+  ASSERT_EQ(setrlimit(RLIMIT_FSIZE, &none), 0);
+  const int result = QUENDELSupportAccountUserCreate("support", kKey);
+  const rlimit any = {RLIM_INFINITY, RLIM_INFINITY};
+  ASSERT_EQ(setrlimit(RLIMIT_FSIZE, &any), 0);
+  EXPECT_EQ(result, -1);
+  EXPECT_THAT(Log(), ElementsAre(Logged(
+                         kUnit, "Failed to update '/run/quendelhome/.ssh/authorized_keys'")));
+  EXPECT_EQ(Calls("chmod"), 0);
+}
+
+TEST(SupportAccountUserCreateTest, FailsWhenTheModeCannotBeSet) {
+  FailCall("chmod", 1, -1, EROFS);
+  EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), -1);
+  EXPECT_THAT(
+      Log(), ElementsAre(Logged(kUnit, "Failed to chmod '/run/quendelhome/.ssh/authorized_keys'")));
+}
+
+// ---- Deleting it.
+
+TEST(SupportAccountUserDeleteTest, RemovesHomeAndAccount) {
+  ASSERT_EQ(QUENDELSupportAccountUserCreate("support", kKey), 0);
+  EXPECT_EQ(QUENDELSupportAccountUserDelete("support"), 0);
+  EXPECT_FALSE(Exists(kHome));
+  EXPECT_FALSE(HasAccount("support"));
+  EXPECT_THAT(Log(), IsEmpty());
+}
+
+TEST(SupportAccountUserDeleteTest, RemovesTheHomeOnlyWhenItIsADirectory) {
+  Record("ALIBCExec");
+  EXPECT_EQ(QUENDELSupportAccountUserDelete("nobody-there"), 0);
+  WriteFile(kHome, "a file");
+  EXPECT_EQ(QUENDELSupportAccountUserDelete("nobody-there"), 0);
+  EXPECT_THAT(Recorded(), IsEmpty());
+  RemoveFile(kHome);
+  MakeSshDir();
+  EXPECT_EQ(QUENDELSupportAccountUserDelete("nobody-there"), 0);
+  EXPECT_THAT(Recorded(), ElementsAre("/bin/rm|-f|-r|/run/quendelhome"));
+}
+
+TEST(SupportAccountUserDeleteTest, AccountThatIsGoneCountsAsDeleted) {
+  EXPECT_EQ(QUENDELSupportAccountUserDelete("nobody-there"), 0);
+  EXPECT_EQ(Calls("ALIBCMResultCoreErrorsGet"), 1);
+  EXPECT_THAT(Log(), IsEmpty());
+}
+
+TEST(SupportAccountUserDeleteTest, FailsWhenTheHomeCannotBeRemoved) {
+  MakeSshDir();
+  FailCall("ALIBCExec", 1, -1);
+  EXPECT_EQ(QUENDELSupportAccountUserDelete("support"), -1);
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to remove '/run/quendelhome'")));
+  EXPECT_EQ(Calls("ARVOLocalAccountUserDelete"), 0);
+  EXPECT_EQ(Calls("ALIBCMResultFree"), 1);
+}
+
+TEST(SupportAccountUserDeleteTest, FailsWhenThereIsNoErrorCode) {
+  FailCall("ALIBCMResultCoreErrorsGet", 1, 0);
+  EXPECT_EQ(QUENDELSupportAccountUserDelete("nobody-there"), -1);
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "ALIBCMResultCoreErrorsGet fail")));
+}
+
+TEST(SupportAccountUserDeleteTest, FailsOnAnyOtherErrorCode) {
+  static const int other[] = {7425};
+  FailCall("ALIBCMResultCoreErrorsGet", 1, reinterpret_cast<long>(other));
+  EXPECT_EQ(QUENDELSupportAccountUserDelete("nobody-there"), -1);
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to delete local account 'nobody-there'\n")));
+}
+
+TEST(SupportAccountUserDeleteTest, GoesByTheFirstErrorCode) {
+  static const int first[] = {7424, 7425};
+  FailCall("ALIBCMResultCoreErrorsGet", 1, reinterpret_cast<long>(first));
+  EXPECT_EQ(QUENDELSupportAccountUserDelete("nobody-there"), 0);
+}
+
+TEST(SupportAccountUserDeleteTest, FreesTheResultOnEveryPath) {
+  EXPECT_EQ(QUENDELSupportAccountUserDelete("nobody-there"), 0);
+  EXPECT_EQ(Calls("ALIBCMResultAlloc"), 1);
+  EXPECT_EQ(Calls("ALIBCMResultFree"), 1);
+  FailCall("ARVOLocalAccountUserDelete", 1, 0);
+  EXPECT_EQ(QUENDELSupportAccountUserDelete("nobody-there"), 0);
+  EXPECT_EQ(Calls("ALIBCMResultFree"), 2);
+  FailCall("ALIBCMResultCoreErrorsGet", 1, 0);
+  EXPECT_EQ(QUENDELSupportAccountUserDelete("nobody-there"), -1);
+  EXPECT_EQ(Calls("ALIBCMResultFree"), 3);
+}
+
+TEST(SupportAccountUserDeleteTest, BearsAResultThatCouldNotBeMade) {
+  FailCall("ALIBCMResultAlloc", 1, 0);
+  EXPECT_EQ(QUENDELSupportAccountUserDelete("nobody-there"), -1);
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "ALIBCMResultCoreErrorsGet fail")));
+}
