@@ -2,13 +2,16 @@
 #include <array>
 #include <cstdarg>
 
+#include "base/json_text.h"
 #include "platform/account.h"
+#include "platform/api_runner.h"
 #include "platform/device.h"
 #include "platform/error.h"
 #include "platform/file.h"
 #include "platform/hash.h"
 #include "platform/key_value.h"
 #include "platform/list.h"
+#include "platform/local_account.h"
 #include "platform/process.h"
 #include "platform/zone.h"
 #include "support/require.h"
@@ -74,6 +77,13 @@ QUENDEL_WRAP(int, ARVOFSMkdirP,
 QUENDEL_WRAP(int, ARVOZoneGet, (char* zone, int size, int* index), zone, size, index);
 QUENDEL_WRAP(int, ARVOZoneDesc, (const char* zone, char* desc, int size), zone, desc, size);
 
+QUENDEL_WRAP(ALIBCMRESULT*, ALIBCMResultAlloc, ());
+QUENDEL_WRAP(void, ALIBCMResultFree, (ALIBCMRESULT * result), result);
+QUENDEL_WRAP(const int*, ALIBCMResultCoreErrorsGet, (ALIBCMRESULT * result), result);
+QUENDEL_WRAP(int, ARVOLocalAccountUserPrepareForQuendel, (const char* user, int kind), user, kind);
+QUENDEL_WRAP(int, ARVOLocalAccountUserDelete,
+             (const char* const* names, int count, ALIBCMRESULT* result), names, count, result);
+
 QUENDEL_WRAP(int, ALIBCProcForkEx, (int flags), flags);
 QUENDEL_WRAP(int, ALIBCPclose, (FILE * stream), stream);
 
@@ -135,4 +145,26 @@ FILE* __wrap_ALIBCPopen(const char* program, const char* mode, ...) {
                       : __real_ALIBCPopen(program, mode, line[1], line[2], line[3], line[4],
                                           line[5], line[6], line[7], line[8], line[9]);
 }
+
+// ARVO::APIRunner::Exec, by the name that the linker knows it by. When it fails, nothing is called
+// and `out` stays as it is.
+QUENDEL_WRAP_BY_HAND(_ZN4ARVO9APIRunner4ExecERN4Json5ValueEPKciS5_RKS2_S5_);
+void __real__ZN4ARVO9APIRunner4ExecERN4Json5ValueEPKciS5_RKS2_S5_(Json::Value& out, const char* api,
+                                                                  int version, const char* method,
+                                                                  const Json::Value& params,
+                                                                  const char* user);
+void __wrap__ZN4ARVO9APIRunner4ExecERN4Json5ValueEPKciS5_RKS2_S5_(Json::Value& out, const char* api,
+                                                                  int version, const char* method,
+                                                                  const Json::Value& params,
+                                                                  const char* user) {
+  const std::string text = quendel::JsonToText(params);
+  const quendel::test::WrappedCall call("ARVO::APIRunner::Exec", api, version, method, text.c_str(),
+                                        user);
+  if (!call.fails()) {
+    __real__ZN4ARVO9APIRunner4ExecERN4Json5ValueEPKciS5_RKS2_S5_(out, api, version, method, params,
+                                                                 user);
+  }
+}
+[[maybe_unused]] static const bool namesTheApiRunner =
+    quendel::test::RegisterWrapped("ARVO::APIRunner::Exec");
 }

@@ -12,12 +12,15 @@
 #include <cstdlib>
 #include <ctime>
 
+#include "platform/api_runner.h"
 #include "platform/file.h"
 #include "platform/key_value.h"
 #include "platform/owned.h"
+#include "platform/process.h"
 #include "support/appliance.h"
 
 using namespace quendel::test;
+using testing::Each;
 using testing::ElementsAre;
 using testing::IsEmpty;
 
@@ -215,6 +218,34 @@ TEST(SleepTest, RunsTheActionEachTime) {
 TEST(SleepTest, CanBeInterrupted) {
   FailCall("sleep", 1, 4);
   EXPECT_EQ(sleep(9), 4U);
+}
+
+TEST(ApiRunnerTest, IsRecordedAndFailsUnderItsOwnName) {
+  Record("ARVO::APIRunner::Exec");
+  FailCall("ARVO::APIRunner::Exec", 1, 0);
+  Json::Value params;
+  params["enable_ssh"] = false;
+  Json::Value out = "before";
+  ARVO::APIRunner::Exec(out, "ARVO.Core.None", 3, "set", params, "admin");
+  EXPECT_EQ(out, "before");
+  ARVO::APIRunner::Exec(out, "ARVO.Core.None", 3, "set", params, "admin");
+  EXPECT_EQ(out["success"], false);
+  EXPECT_EQ(Calls("ARVO::APIRunner::Exec"), 2);
+  EXPECT_THAT(Recorded(), Each("ARVO.Core.None|3|set|{\"enable_ssh\":false}|admin"));
+}
+
+TEST(RunnersTest, AreRecordedByProgramAndArguments) {
+  Record("ALIBCExec");
+  Record("ALIBCExecl");
+  Record("ALIBCPopen");
+  EXPECT_EQ(ALIBCExec("/bin/true", "a", "", nullptr, nullptr), 0);
+  EXPECT_EQ(ALIBCExecl("/bin/true", 0xBB, "1", "2", "3", "4", "5", "6", nullptr), 0);
+  FILE* const output = ALIBCPopen("/bin/echo", "r", "x", nullptr);
+  ASSERT_NE(output, nullptr);
+  char text[8] = {};
+  EXPECT_STREQ(fgets(text, sizeof text, output), "x\n");
+  ALIBCPclose(output);
+  EXPECT_THAT(Recorded(), ElementsAre("/bin/true|a|", "/bin/true|1|2|3|4|5|6", "/bin/echo|x"));
 }
 
 TEST(FormaddTest, PassesItsOptionsOn) {
