@@ -76,6 +76,12 @@ TEST(SupportAccountUserCreateTest, MakesTheSshDirOnlyWhenItIsMissing) {
   EXPECT_EQ(Recorded().size(), 1U);
 }
 
+TEST(SupportAccountUserCreateTest, MakesTheSshDirInAHomeThatIsThere) {
+  ASSERT_EQ(mkdir(kHome, 0755), 0);
+  EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), 0);
+  EXPECT_EQ(ReadFile(kKeyFile), kKey);
+}
+
 TEST(SupportAccountUserCreateTest, SetsTheOwnerOfAHomeThatIsThere) {
   MakeSshDir();
   EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), 0);
@@ -193,8 +199,10 @@ TEST(SupportAccountUserCreateTest, FailsWhenTheKeyCannotBeWritten) {
 }
 
 TEST(SupportAccountUserCreateTest, FailsWhenTheModeCannotBeSet) {
+  umask(0);
   FailCall("chmod", 1, -1, EROFS);
   EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), -1);
+  EXPECT_EQ(Mode(kKeyFile), 0666U);  // as any new file has it
   EXPECT_THAT(
       Log(), ElementsAre(Logged(kUnit, "Failed to chmod '/run/quendelhome/.ssh/authorized_keys'")));
 }
@@ -219,6 +227,13 @@ TEST(SupportAccountUserDeleteTest, RemovesTheHomeOnlyWhenItIsADirectory) {
   MakeSshDir();
   EXPECT_EQ(QUENDELSupportAccountUserDelete("nobody-there"), 0);
   EXPECT_THAT(Recorded(), ElementsAre("/bin/rm|-f|-r|/run/quendelhome"));
+}
+
+TEST(SupportAccountUserDeleteTest, LeavesAHomeThatItCannotTellToBeOne) {
+  MakeSshDir();
+  FailCall("ALIBCFileCheckDir", 1, -1);
+  EXPECT_EQ(QUENDELSupportAccountUserDelete("nobody-there"), 0);
+  EXPECT_TRUE(Exists(kSshDir));
 }
 
 TEST(SupportAccountUserDeleteTest, AccountThatIsGoneCountsAsDeleted) {
