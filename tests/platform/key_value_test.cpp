@@ -230,6 +230,25 @@ TEST(FileGetPairTest, ReadsEveryPair) {
               ElementsAre(Pair("a", "1"), Pair("b", " 2"), Pair("c", "\"\""), Pair("d", "")));
 }
 
+TEST(FileGetPairTest, TakesNoCommentNorAnyOtherLineForAPair) {
+  WriteFile(kPath, "#a=1\n ;b=2\n\t[c=3]\n =4\n==5\nd\n" + std::string("e\0=6\n", 5) + "f=7\n");
+  platform::OwnedHash hash(8);
+  EXPECT_EQ(ALIBCFileGetPair(kPath, hash.slot()), 1);
+  EXPECT_THAT(Pairs(hash), ElementsAre(Pair("f", "7")));
+}
+
+TEST(FileGetPairTest, ReadsAFileThatTellsNoSize) {
+  // The kernel's list of mounts comes in pieces of a page.
+  constexpr int kMounts = 200;
+  for (int i = 0; i < kMounts; ++i) {
+    const std::string path = "/tmp/mount" + std::to_string(i);
+    mkdir(path.c_str(), 0700);
+    ASSERT_EQ(mount(path.c_str(), path.c_str(), "tmpfs", 0, "size=4k"), 0);
+  }
+  platform::OwnedHash hash(8);
+  EXPECT_GE(ALIBCFileGetPair("/proc/self/mountinfo", hash.slot()), kMounts);
+}
+
 TEST(FileGetPairTest, LetsTheLastLineWin) {
   WriteFile(kPath, "a=1\na=2\n");
   platform::OwnedHash hash(8);
