@@ -5,6 +5,7 @@
 #include "base/log.h"
 #include "base/paths.h"
 #include "platform/api_runner.h"
+#include "platform/hash.h"
 #include "platform/key_value.h"
 #include "platform/owned.h"
 #include "quendel/conf.h"
@@ -29,6 +30,12 @@ bool IsClosing(QuendelActionProgress_t progress) {
   return static_cast<unsigned int>(progress) + 1U <= 1U;
 }
 
+// Without memory for the name of an account, the account must not pass for one that is not there.
+std::string ValueOrThrow(ALIBSZHASH* hash, const char* key) {
+  const char* value = ALIBCSzHashGetValue(hash, key);
+  return value == nullptr ? "" : value;
+}
+
 bool ReadSession(Session& session) try {
   platform::OwnedHash hash(kHashPairs);
   if (!hash) {
@@ -39,8 +46,8 @@ bool ReadSession(Session& session) try {
     QUENDEL_LOG("Failed to get quendel key configuration file");
     return false;
   }
-  session.stop_sshd = QUENDELGetHashValue(hash.get(), "stop_sshd_after_complete") == "yes";
-  session.account = QUENDELGetHashValue(hash.get(), "remote_account");
+  session.stop_sshd = ValueOrThrow(hash.get(), "stop_sshd_after_complete") == "yes";
+  session.account = ValueOrThrow(hash.get(), "remote_account");
   return true;
 } catch (...) {
   QUENDEL_LOG("Fail to allocate memory for alibc hash");

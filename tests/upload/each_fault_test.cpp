@@ -105,7 +105,7 @@ void ExpectRowForEachCall(const std::vector<Fault>& table, int (*operation)()) {
                                "calloc",
                                "chown",
                                "chmod",
-                               "fopen",
+                               "fdopen",
                                "ALIBCExec",
                                "ALIBCExecl",
                                "ALIBCPopen",
@@ -333,6 +333,10 @@ std::vector<Fault> OpenFaults() {
       Row("ARVOLocalAccountUserPrepareForQuendel", 1, -1, -1,
           {"quendel_support_account_user: Failed to prepare local account 'support'"},
           {kHome, kSshDir}),
+      Row("fdopen", 1, 0, -1,
+          {"quendel_support_account_user: Failed to open "
+           "'/run/quendelhome/.ssh/authorized_keys'"},
+          kHomeAndAll),
       Row("chmod", 1, -1, -1,
           {"quendel_support_account_user: Failed to chmod "
            "'/run/quendelhome/.ssh/authorized_keys'"},

@@ -1,0 +1,216 @@
+// Memory runs out at each allocation in turn. Whichever it is, nothing is thrown at the caller, and
+// a failure is one of the documented ones, with its line in the log.
+//
+// The test kit allocates, in places where the library's calls pass through it; this test does
+// without.
+#include <gmock/gmock.h>
+#include <sys/stat.h>
+
+#include <cstdarg>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <filesystem>
+#include <new>
+
+#include "base/json_text.h"
+#include "quendel.h"
+#include "support/appliance.h"
+
+namespace {
+
+// How many allocations are still to succeed before one fails; negative when none is to.
+int allocationsLeft = -1;
+
+// What was logged, without allocating: lines, each behind a line end.
+char logged[1 << 16];
+
+void Append(const char* format, va_list arguments) {
+  const size_t length = strlen(logged);
+  logged[length] = '\n';
+  vsnprintf(logged + length + 1, sizeof logged - length - 1, format, arguments);
+}
+
+class FailingAllocation {
+ public:
+  explicit FailingAllocation(int nth) { allocationsLeft = nth; }
+  ~FailingAllocation() { allocationsLeft = -1; }
+  FailingAllocation(const FailingAllocation&) = delete;
+  FailingAllocation& operator=(const FailingAllocation&) = delete;
+};
+
+}  // namespace
+
+void* operator new(size_t size) {
+  if (allocationsLeft >= 0 && allocationsLeft-- == 0) {
+    throw std::bad_alloc();
+  }
+  void* memory = malloc(size == 0 ? 1 : size);
+  if (memory == nullptr) {
+    throw std::bad_alloc();
+  }
+  return memory;
+}
+
+void operator delete(void* memory) noexcept {
+  free(memory);
+}
+
+void operator delete(void* memory, size_t /*size*/) noexcept {
+  free(memory);
+}
+
+extern "C" void __wrap_syslog(int /*priority*/, const char* format, ...) {
+  va_list arguments;
+  va_start(arguments, format);
+  Append(format, arguments);
+  va_end(arguments);
+}
+
+extern "C" void __wrap___syslog_chk(int /*priority*/, int /*flag*/, const char* format, ...) {
+  va_list arguments;
+  va_start(arguments, format);
+  Append(format, arguments);
+  va_end(arguments);
+}
+
+namespace {
+
+using namespace quendel::test;
+using testing::AllOf;
+using testing::Contains;
+using testing::Field;
+using testing::Gt;
+using testing::HasSubstr;
+using testing::MatchesRegex;
+using testing::SizeIs;
+
+namespace fs = std::filesystem;
+
+auto OpenDescriptors() {
+  return std::distance(fs::directory_iterator("/proc/self/fd"), fs::directory_iterator());
+}
+
+struct Outcome {
+  int result;
+  std::string log;
+};
+
+// Returns what came of the operation with each of its allocations failed.
+std::vector<Outcome> FailEachAllocation(
+    void (*prepare)(), int (*operation)(), void (*inspect)() = [] {}) {
+  std::vector<Outcome> outcomes;
+  // What a process sets up once, libcurl for instance, is not to be counted.
+  prepare();
+  EXPECT_EQ(operation(), 0);
+  const auto descriptors = OpenDescriptors();
+  for (int nth = 0;; ++nth) {
+    prepare();
+    logged[0] = '\0';
+    int result = 0;
+    bool hasFailed = false;
+    {
+      const FailingAllocation failing(nth);
+      result = operation();
+      hasFailed = allocationsLeft < 0;
+    }
+    if (!hasFailed) {
+      EXPECT_EQ(result, 0);
+      return outcomes;
+    }
+    EXPECT_TRUE(result == 0 || result == -1) << nth << " gave " << result;
+    EXPECT_TRUE(result == 0 || logged[0] != '\0') << nth;
+    EXPECT_EQ(OpenDescriptors(), descriptors) << nth;
+    inspect();
+    outcomes.push_back({result, logged});
+  }
+}
+
+void SetTool(const std::string& path, const std::string& script) {
+  RemoveFile(path);
+  WriteFile(path, "#!/bin/sh\n" + script + "\n");
+  chmod(path.c_str(), 0755);
+}
+
+const Json::Value& Request() {
+  static const Json::Value request = [] {
+    Json::Value files;
+    quendel::JsonFromText(R"([{"file_type":"coredump","file_uuid":"the first of the files",
+                               "file_path":"/var/crash/@app.core"},
+                              {"file_type":"debug.dat","file_uuid":"the second of the files"}])",
+                          files);
+    return files;
+  }();
+  return request;
+}
+
+}  // namespace
+
+TEST(OutOfMemoryTest, FailsAnUploadAsDocumented) {
+  const auto prepare = [] {
+    SetIdentity();
+    WriteFile("/var/crash/@app.core", "dump");
+    SetTool("/usr/arvo/bin/arvomsg_collector2", "echo facts > \"$1/facts.txt\"");
+    SetTool("/usr/bin/zip", "echo archive > /tmp/quendel/debugdat.zip");
+  };
+  const std::vector<Outcome> outcomes = FailEachAllocation(
+      prepare, [] { return QUENDELUploadFile(17, QUENDEL_ACT_PROGRESS_RUN, Request()); });
+  ASSERT_THAT(outcomes, SizeIs(Gt(50U)));
+  // The first is the path that is to be matched, and costs the request.
+  EXPECT_EQ(outcomes[0].result, -1);
+  EXPECT_THAT(outcomes[0].log,
+              MatchesRegex("\nquendel_upload_file:[0-9]+ Validate filepath failed"));
+  // Later ones cost one file, or the delivery.
+  EXPECT_THAT(
+      outcomes,
+      Contains(AllOf(
+          Field(&Outcome::result, 0),
+          Field(&Outcome::log, MatchesRegex("\nquendel_upload_file:[0-9]+ Prepare uploaded "
+                                            "file failed .coredump.:..var.crash.@app.core.")))));
+  EXPECT_THAT(outcomes, Contains(Field(&Outcome::log, HasSubstr("Send collect data fail"))));
+}
+
+TEST(OutOfMemoryTest, FailsAnUploadWithoutFilesAsDocumented) {
+  EXPECT_THAT(FailEachAllocation(
+                  [] { SetIdentity(); },
+                  [] { return QUENDELUploadFile(17, QUENDEL_ACT_PROGRESS_RUN, Json::Value()); }),
+              SizeIs(Gt(10U)));
+}
+
+TEST(OutOfMemoryTest, FailsTheDeliveryAsDocumented) {
+  EXPECT_THAT(
+      FailEachAllocation([] { SetIdentity(); }, [] { return QUENDELSendUploadData(17, {}); }),
+      SizeIs(Gt(10U)));
+}
+
+// As long as there is an account, there is a session that can be closed.
+TEST(OutOfMemoryTest, FailsTheEndOfASessionAsDocumented) {
+  const auto prepare = [] {
+    SetIdentity();
+    ASSERT_EQ(QUENDELSupportAccountUserCreate("long-name-of-a-support-account", "key"), 0);
+    WriteFile("/usr/arvo/etc/quendel.remote.conf",
+              "remote_account=long-name-of-a-support-account\nstop_sshd_after_complete=yes\n");
+  };
+  const auto inspect = [] {
+    EXPECT_TRUE(!Exists("/run/quendelhome") || Exists("/usr/arvo/etc/quendel.remote.conf"));
+  };
+  EXPECT_THAT(
+      FailEachAllocation(
+          prepare, [] { return QUENDELRemoteClose(17, QUENDEL_ACT_PROGRESS_DONE); }, inspect),
+      SizeIs(Gt(10U)));
+}
+
+TEST(OutOfMemoryTest, FailsTheSupportAccountAsDocumented) {
+  FailEachAllocation([] { RemoveFile("/run/quendelhome"); },
+                     [] { return QUENDELSupportAccountUserCreate("support", "key"); });
+  FailEachAllocation([] { ASSERT_EQ(QUENDELSupportAccountUserCreate("support", "key"), 0); },
+                     [] { return QUENDELSupportAccountUserDelete("support"); });
+}
+
+TEST(OutOfMemoryTest, FailsTheSessionKeyAsDocumented) {
+  FailEachAllocation([] { SetTool("/usr/arvo/sbin/arvocloudserviceauth", "echo key"); },
+                     [] {
+                       char key[32] = {};
+                       return QUENDELGetRemoteSessionKey(key, sizeof key - 1);
+                     });
+}
