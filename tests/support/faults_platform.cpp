@@ -81,8 +81,6 @@ QUENDEL_WRAP(ALIBCMRESULT*, ALIBCMResultAlloc, ());
 QUENDEL_WRAP(void, ALIBCMResultFree, (ALIBCMRESULT * result), result);
 QUENDEL_WRAP(const int*, ALIBCMResultCoreErrorsGet, (ALIBCMRESULT * result), result);
 QUENDEL_WRAP(int, ARVOLocalAccountUserPrepareForQuendel, (const char* user, int kind), user, kind);
-QUENDEL_WRAP(int, ARVOLocalAccountUserDelete,
-             (const char* const* names, int count, ALIBCMRESULT* result), names, count, result);
 
 QUENDEL_WRAP(int, ALIBCProcForkEx, (int flags), flags);
 QUENDEL_WRAP(int, ALIBCPclose, (FILE * stream), stream);
@@ -108,6 +106,14 @@ CommandLine TakeCommandLine(const char* program, va_list arguments) {
 }  // namespace
 
 extern "C" {
+
+// No null pointer ends the names, so only the first is recorded.
+QUENDEL_WRAP_BY_HAND(ARVOLocalAccountUserDelete);
+int __real_ARVOLocalAccountUserDelete(const char* const* names, int count, ALIBCMRESULT* result);
+int __wrap_ARVOLocalAccountUserDelete(const char* const* names, int count, ALIBCMRESULT* result) {
+  const quendel::test::WrappedCall call("ARVOLocalAccountUserDelete", names[0], count);
+  return call.fails() ? call.result<int>() : __real_ARVOLocalAccountUserDelete(names, count, result);
+}
 
 QUENDEL_WRAP_BY_HAND(ALIBCExec);
 int __real_ALIBCExec(const char* program, const char* a1, const char* a2, const char* a3,
