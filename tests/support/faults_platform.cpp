@@ -112,7 +112,8 @@ QUENDEL_WRAP_BY_HAND(ARVOLocalAccountUserDelete);
 int __real_ARVOLocalAccountUserDelete(const char* const* names, int count, ALIBCMRESULT* result);
 int __wrap_ARVOLocalAccountUserDelete(const char* const* names, int count, ALIBCMRESULT* result) {
   const quendel::test::WrappedCall call("ARVOLocalAccountUserDelete", names[0], count);
-  return call.fails() ? call.result<int>() : __real_ARVOLocalAccountUserDelete(names, count, result);
+  return call.fails() ? call.result<int>()
+                      : __real_ARVOLocalAccountUserDelete(names, count, result);
 }
 
 QUENDEL_WRAP_BY_HAND(ALIBCExec);
@@ -153,16 +154,16 @@ FILE* __wrap_ALIBCPopen(const char* program, const char* mode, ...) {
 }
 
 // ARVO::APIRunner::Exec, by the name that the linker knows it by. When it fails, nothing is called
-// and `out` stays as it is.
+// and `out` stays as it is. Weak, so that a test program can answer in its place. Weak, so that a
+// test program can answer in its place.
 QUENDEL_WRAP_BY_HAND(_ZN4ARVO9APIRunner4ExecERN4Json5ValueEPKciS5_RKS2_S5_);
 void __real__ZN4ARVO9APIRunner4ExecERN4Json5ValueEPKciS5_RKS2_S5_(Json::Value& out, const char* api,
                                                                   int version, const char* method,
                                                                   const Json::Value& params,
                                                                   const char* user);
-void __wrap__ZN4ARVO9APIRunner4ExecERN4Json5ValueEPKciS5_RKS2_S5_(Json::Value& out, const char* api,
-                                                                  int version, const char* method,
-                                                                  const Json::Value& params,
-                                                                  const char* user) {
+__attribute__((weak)) void __wrap__ZN4ARVO9APIRunner4ExecERN4Json5ValueEPKciS5_RKS2_S5_(
+    Json::Value& out, const char* api, int version, const char* method, const Json::Value& params,
+    const char* user) {
   const std::string text = quendel::JsonToText(params);
   const quendel::test::WrappedCall call("ARVO::APIRunner::Exec", api, version, method, text.c_str(),
                                         user);
