@@ -154,8 +154,7 @@ FILE* __wrap_ALIBCPopen(const char* program, const char* mode, ...) {
 }
 
 // ARVO::APIRunner::Exec, by the name that the linker knows it by. When it fails, nothing is called
-// and `out` stays as it is. Weak, so that a test program can answer in its place. Weak, so that a
-// test program can answer in its place.
+// and `out` stays as it is. Weak, so that a test program can answer in its place.
 QUENDEL_WRAP_BY_HAND(_ZN4ARVO9APIRunner4ExecERN4Json5ValueEPKciS5_RKS2_S5_);
 void __real__ZN4ARVO9APIRunner4ExecERN4Json5ValueEPKciS5_RKS2_S5_(Json::Value& out, const char* api,
                                                                   int version, const char* method,
