@@ -8,6 +8,8 @@
 #include <cerrno>
 #include <csignal>
 #include <cstdio>
+#include <cstdlib>
+#include <cstring>
 #include <string>
 #include <string_view>
 #include <system_error>
@@ -18,6 +20,9 @@ namespace quendelctl {
 namespace {
 
 constexpr size_t kLongestPieceBytes = 65536;
+constexpr char kEraseRest[] = "\x1b[K";
+
+int rawStderr = STDERR_FILENO;
 
 [[noreturn]] void Fail(const char* what) {
   throw std::system_error(errno, std::generic_category(), what);
@@ -55,6 +60,7 @@ size_t ShowableBytes(const std::string& text) {
 
 void Show(int input, int output) {
   constexpr char kKept[] = "\n\t";
+  const std::string before = CanRedraw(output) ? kEraseRest : "";  // a progress line, for example
   std::string pending;
   char chunk[4096];
   for (;;) {
@@ -67,7 +73,9 @@ void Show(int input, int output) {
     }
     pending.append(chunk, static_cast<size_t>(got));
     const size_t showable = ShowableBytes(pending);
-    WriteAll(output, Printable(std::string_view(pending).substr(0, showable), kKept));
+    if (showable > 0) {
+      WriteAll(output, before + Printable(std::string_view(pending).substr(0, showable), kKept));
+    }
     pending.erase(0, showable);
   }
   WriteAll(output, Printable(pending, kKept));
@@ -105,13 +113,24 @@ SafeStderr::SafeStderr() : original_(fcntl(STDERR_FILENO, F_DUPFD_CLOEXEC, 3)) {
   close(ends[0]);
   dup2(ends[1], STDERR_FILENO);
   close(ends[1]);
+  rawStderr = original_;
 }
 
 SafeStderr::~SafeStderr() {
   fflush(stderr);
   dup2(original_, STDERR_FILENO);
+  rawStderr = STDERR_FILENO;
   close(original_);
   waitpid(filter_, nullptr, 0);
+}
+
+int RawStderr() {
+  return rawStderr;
+}
+
+bool CanRedraw(int descriptor) {
+  const char* terminal = getenv("TERM");
+  return isatty(descriptor) == 1 && terminal != nullptr && strcmp(terminal, "dumb") != 0;
 }
 
 }  // namespace quendelctl

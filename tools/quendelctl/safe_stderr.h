@@ -23,6 +23,13 @@ class SafeStderr {
   pid_t filter_;
 };
 
+// Returns the descriptor of the standard error output itself, for what this program draws on a
+// terminal. Nothing from elsewhere may be written there.
+int RawStderr();
+
+// Tells whether this is a terminal on which a line can be taken back and written again.
+bool CanRedraw(int descriptor);
+
 }  // namespace quendelctl
 
 #endif  // QUENDELCTL_SAFE_STDERR_H_
