@@ -41,16 +41,29 @@ std::string ReadFileOrStandardInput(const std::string& argument, const std::stri
   return ReadWhole(argument, file.get(), name);
 }
 
+template <typename Number>
+bool IsWholly(const std::string& text, Number& number) {
+  const char* end = text.data() + text.size();
+  const auto [stop, error] = std::from_chars(text.data(), end, number);
+  return error == std::errc() && stop == end;
+}
+
 }  // namespace
 
 int ReadNumber(const std::string& argument, const std::string& text) {
   int number = 0;
-  const char* end = text.data() + text.size();
-  const auto [stop, error] = std::from_chars(text.data(), end, number);
-  if (error != std::errc() || stop != end) {
+  if (!IsWholly(text, number)) {
     throw CLI::ValidationError(argument, text + " is not a whole number that fits 32 bits");
   }
   return number;
+}
+
+int64_t ReadMoment(const std::string& argument, const std::string& text) {
+  int64_t seconds = 0;
+  if (!IsWholly(text, seconds) || seconds < 0) {
+    throw CLI::ValidationError(argument, text + " is not a number of seconds since the epoch");
+  }
+  return seconds;
 }
 
 Json::Value ReadJson(const std::string& argument, const std::string& text) {

@@ -4,6 +4,7 @@
 
 #include <json/value.h>
 
+#include <cstdint>
 #include <string>
 
 namespace quendelctl {
@@ -12,6 +13,9 @@ namespace quendelctl {
 
 // Reads a whole number in decimal, with nothing around it.
 int ReadNumber(const std::string& argument, const std::string& text);
+
+// Reads a moment: seconds since the epoch in decimal, not negative, with nothing around them.
+int64_t ReadMoment(const std::string& argument, const std::string& text);
 
 // Reads a JSON value from what the user gave: an object's JSON text, which begins with "{", or else
 // the name of a file that holds JSON of any kind, "-" for the standard input.

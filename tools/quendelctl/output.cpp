@@ -5,6 +5,7 @@
 
 #include <cerrno>
 #include <cstdio>
+#include <sstream>
 #include <system_error>
 
 #include "printable.h"
@@ -12,21 +13,21 @@
 namespace quendelctl {
 namespace {
 
-std::string JsonLine(const Json::Value& value, bool utf8) {
+std::string JsonText(const Json::Value& value, bool utf8, const char* indentation = "") {
   Json::StreamWriterBuilder builder;
-  builder["indentation"] = "";
+  builder["indentation"] = indentation;
   builder["emitUTF8"] = utf8;
   return Json::writeString(builder, value);
 }
 
 // Without UTF-8 JsonCpp escapes every character that does not print, but for this one.
-std::string AsciiJsonLine(const Json::Value& value) {
+std::string AsciiJson(const Json::Value& value, const char* indentation = "") {
   constexpr char kDelete = '\x7f';
-  std::string line = JsonLine(value, false);
-  for (size_t at = line.find(kDelete); at != line.npos; at = line.find(kDelete, at)) {
-    line.replace(at, 1, "\\u007f");
+  std::string text = JsonText(value, false, indentation);
+  for (size_t at = text.find(kDelete); at != text.npos; at = text.find(kDelete, at)) {
+    text.replace(at, 1, "\\u007f");
   }
-  return line;
+  return text;
 }
 
 }  // namespace
@@ -35,7 +36,7 @@ void PrintResult(const Result& result, bool json) {
   if (json) {
     Json::Value object = result.members;
     object["success"] = result.success;
-    PrintText(AsciiJsonLine(object) + "\n");
+    PrintText(AsciiJson(object) + "\n");
     return;
   }
   for (const std::string& line : result.lines) {
@@ -56,7 +57,16 @@ void FinishOutput() {
 }
 
 std::string JsonForReader(const Json::Value& value) {
-  return JsonLine(value, true);
+  return JsonText(value, true);
+}
+
+std::vector<std::string> JsonLines(const Json::Value& value) {
+  std::vector<std::string> lines;
+  std::istringstream text(AsciiJson(value, "  "));
+  for (std::string line; std::getline(text, line);) {
+    lines.push_back(line);
+  }
+  return lines;
 }
 
 }  // namespace quendelctl

@@ -5,6 +5,7 @@
 #include <json/value.h>
 
 #include <string>
+#include <vector>
 
 #include "command.h"
 
@@ -22,6 +23,10 @@ void FinishOutput();
 // Returns the value's JSON text on one line, for a reader: characters beyond ASCII stay what they
 // are.
 std::string JsonForReader(const Json::Value& value);
+
+// Returns the value's JSON text in ASCII, indented, line by line: for a reader, and JSON still
+// after it was printed.
+std::vector<std::string> JsonLines(const Json::Value& value);
 
 }  // namespace quendelctl
 
