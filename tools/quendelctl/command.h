@@ -31,8 +31,11 @@ struct Command {
 };
 
 // The families of commands.
+std::vector<Command> CollectionCommands();
+std::vector<Command> CollectorCommands();
 std::vector<Command> ConversationCommands();
 std::vector<Command> DeviceCommands();
+std::vector<Command> PerformanceCommands();
 
 }  // namespace quendelctl
 

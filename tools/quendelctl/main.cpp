@@ -28,7 +28,9 @@ constexpr char kFooter[] =
 Exit status: 0 success, 1 the operation failed, 2 the command line is wrong.
 The reasons of a failure go to the standard error output and to the system's log.)";
 
-constexpr std::vector<Command> (*kFamilies[])() = {ConversationCommands, DeviceCommands};
+constexpr std::vector<Command> (*kFamilies[])() = {ConversationCommands, CollectionCommands,
+                                                   PerformanceCommands, CollectorCommands,
+                                                   DeviceCommands};
 
 // What the command line asked for.
 struct Request {
@@ -36,11 +38,22 @@ struct Request {
   bool json = false;
 };
 
+// A command that has commands of its own leaves the output to them.
+void DeclareJson(CLI::App& command, Request& request) {
+  const std::vector<CLI::App*> own = command.get_subcommands([](CLI::App*) { return true; });
+  for (CLI::App* subcommand : own) {
+    DeclareJson(*subcommand, request);
+  }
+  if (own.empty()) {
+    command.add_flag("--json", request.json, "Print one line of JSON instead of text");
+  }
+}
+
 void DeclareCommand(CLI::App& app, const Command& command, Request& request) {
   CLI::App* subcommand = app.add_subcommand(command.name, command.summary);
   subcommand->group("Commands")->footer(command.examples);
   Action action = command.declare(*subcommand);
-  subcommand->add_flag("--json", request.json, "Print one line of JSON instead of text");
+  DeclareJson(*subcommand, request);
   subcommand->callback([action, &request] { request.action = action; });
 }
 

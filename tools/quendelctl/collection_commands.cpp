@@ -1,0 +1,291 @@
+// The commands that gather what is new on the device, pack it and deliver it.
+#include <sys/stat.h>
+
+#include <cerrno>
+#include <csignal>
+#include <cstdlib>
+#include <cstring>
+#include <ctime>
+#include <filesystem>
+#include <memory>
+
+#include "arguments.h"
+#include "command.h"
+#include "progress.h"
+#include "quendel.h"
+#include "run_watch.h"
+#include "worker.h"
+
+namespace quendelctl {
+namespace {
+
+namespace fs = std::filesystem;
+
+struct CollectArguments {
+  bool send = false;
+  bool keep = false;
+  std::string perf;
+};
+
+Json::Value ReadSeries(const std::string& text) {
+  const Json::Value series = text.empty() ? Json::objectValue : ReadJson("--perf", text);
+  if (!series.isObject()) {
+    throw CLI::ValidationError("--perf", "not a series of samples: a JSON object is needed");
+  }
+  return series;
+}
+
+WorkerEnd Collect(const CollectArguments& arguments, const Json::Value& series, RunWatch& run) {
+  Progress progress;
+  const WorkerEnd end = RunInWorker(
+      [&] { return QUENDELStartCollect(arguments.keep ? 0 : 1, arguments.send ? 1 : 0, series); },
+      [&](pid_t worker) {
+        run.Look(worker);
+        progress.Show(run);
+      });
+  progress.Finish();
+  run.Look(0);  // for what came after the last look and is still there
+  return end;
+}
+
+// A run that was ended in the middle leaves its files, and the files that mark its collectors.
+void CleanUp(const RunWatch& run, bool keep) {
+  if (!keep && !run.Directory().empty()) {
+    QUENDELRecursiveRmdir(run.Directory().c_str());
+    QUENDELRecursiveRmdir(run.Archive().c_str());
+  }
+  for (const char* prefix : {"udc.p.", "log.p."}) {
+    std::error_code error;
+    for (const auto& entry : fs::directory_iterator("/tmp/quendel", error)) {
+      const std::string name = entry.path().filename();
+      if (name.rfind(prefix, 0) != 0) {
+        continue;
+      }
+      const int id = atoi(name.c_str() + strlen(prefix));
+      if (id > 0 && kill(id, 0) != 0 && errno == ESRCH) {
+        fs::remove(entry.path(), error);
+      }
+    }
+  }
+}
+
+std::string DescribeFailure(const WorkerEnd& end) {
+  if (end.interrupted) {
+    return "The collection was interrupted.";
+  }
+  if (end.signal == SIGTERM) {
+    return "The collection failed: the run was ended by SIGTERM, which it sends itself when it "
+           "fails before its collectors have started.";
+  }
+  if (end.signal != 0) {
+    return "The collection failed: the run was ended by signal " + std::to_string(end.signal) +
+           " (" + strsignal(end.signal) + ").";
+  }
+  return "The collection failed.";
+}
+
+std::string DescribeLogs(const std::set<std::string>& logs) {
+  if (logs.empty()) {
+    return "No log had anything new.";
+  }
+  std::string text = logs.size() == 1 ? "1 log has" : std::to_string(logs.size()) + " logs have";
+  text += " something new:";
+  for (const std::string& name : logs) {
+    text += " " + name;
+  }
+  return text;
+}
+
+Json::Value JsonList(const std::set<std::string>& texts) {
+  Json::Value list = Json::arrayValue;
+  for (const std::string& text : texts) {
+    list.append(text);
+  }
+  return list;
+}
+
+void TellWhatWasCollected(const CollectArguments& arguments, const RunWatch& run, Result& result) {
+  const std::string size = run.ArchiveBytes() ? std::to_string(*run.ArchiveBytes()) : "";
+  result.lines.push_back("The collection is complete.");
+  if (run.logs()) {
+    result.lines.push_back(DescribeLogs(*run.logs()));
+    result.members["logs_collected"] = JsonList(*run.logs());
+  }
+  if (arguments.send) {
+    result.lines.push_back("The server accepted the archive" +
+                           (size.empty() ? "." : " of " + size + " bytes."));
+    result.members["logs_sent"] = result.members["logs_collected"];
+  }
+  if (run.ArchiveBytes()) {
+    result.members["bytes"] = static_cast<Json::UInt64>(*run.ArchiveBytes());
+  }
+}
+
+void TellWhatIsKept(const RunWatch& run, Result& result) {
+  std::error_code error;
+  if (fs::is_directory(run.Directory(), error)) {
+    result.lines.push_back("Run directory: " + run.Directory());
+    result.members["run_directory"] = run.Directory();
+  }
+  if (fs::is_regular_file(run.Archive(), error)) {
+    result.lines.push_back("Archive: " + run.Archive());
+    result.members["archive"] = run.Archive();
+  } else if (result.success) {
+    result.lines.push_back("Which archive in /tmp is this run's cannot be told.");
+  }
+}
+
+Result RunCollection(const CollectArguments& arguments) {
+  const Json::Value series = ReadSeries(arguments.perf);
+  RunWatch run(arguments.send);
+  const WorkerEnd end = Collect(arguments, series, run);
+
+  Result result;
+  result.success = end.result == 0;
+  result.members["interrupted"] = end.interrupted;
+  result.members["sent"] = result.success && arguments.send;
+  for (const char* unknown : {"archive", "bytes", "logs_collected", "run_directory"}) {
+    result.members[unknown] = Json::nullValue;
+  }
+  result.members["logs_sent"] = Json::arrayValue;
+  if (result.success) {
+    TellWhatWasCollected(arguments, run, result);
+  } else {
+    result.lines.push_back(DescribeFailure(end));
+  }
+  if (!end.result) {
+    CleanUp(run, arguments.keep);
+  }
+  if (arguments.keep) {
+    TellWhatIsKept(run, result);
+  }
+  return result;
+}
+
+Action DeclareCollect(CLI::App& command) {
+  const auto arguments = std::make_shared<CollectArguments>();
+  command.add_flag("--send", arguments->send, "Send the archive to the server");
+  command.add_flag("--keep", arguments->keep,
+                   "Keep the run directory and the archive, and tell where they are");
+  command
+      .add_option("--perf", arguments->perf,
+                  "Performance series to put in, as perf --series prints it: a\n"
+                  "file (- is the standard input) or a JSON object")
+      ->type_name("FILE|JSON");
+  return [arguments] { return RunCollection(*arguments); };
+}
+
+struct TarArguments {
+  std::string directory;
+  std::string archive;
+};
+
+// The library takes the parent and the last component of a path that has both.
+std::string ReadDirectory(const std::string& text) {
+  std::string path = fs::absolute(text);
+  path.erase(path.find_last_not_of('/') + 1);
+  std::string name = fs::path(path).filename();
+  if (name == "." || name == "..") {
+    std::error_code error;
+    path = fs::canonical(path, error);
+    name = fs::path(path).filename();
+  }
+  if (text.empty() || name.empty()) {
+    throw CLI::ValidationError("DIR", "a directory that has a name is needed");
+  }
+  if (name[0] == '-') {  // tar would take it for an option
+    throw CLI::ValidationError("DIR", "the name " + name + " begins with a -");
+  }
+  return path.rfind('/') == 0 ? "/" + path : path;
+}
+
+Result PackDirectory(const TarArguments& arguments) {
+  const std::string directory = ReadDirectory(arguments.directory);
+  // tar would take a name with a colon in it for one on another machine, but not a path.
+  const std::string archive = fs::absolute(arguments.archive);
+  Result result;
+  result.success = QUENDELTarCollectData(directory.c_str(), archive.c_str()) == 0;
+  result.members["archive"] = arguments.archive;
+  if (!result.success) {
+    result.lines = {arguments.directory + " could not be packed."};
+    return result;
+  }
+  std::error_code error;
+  const uint64_t bytes = fs::file_size(archive, error);
+  result.lines = {"Packed " + arguments.directory + " into " + arguments.archive +
+                  (error ? "." : ", " + std::to_string(bytes) + " bytes.")};
+  result.members["bytes"] = error ? Json::Value() : static_cast<Json::UInt64>(bytes);
+  return result;
+}
+
+Action DeclareTar(CLI::App& command) {
+  const auto arguments = std::make_shared<TarArguments>();
+  command.add_option("DIR", arguments->directory, "What to pack")->required()->type_name("");
+  command.add_option("ARCHIVE", arguments->archive, "The archive to make or replace, a .tar.xz")
+      ->required()
+      ->type_name("");
+  return [arguments] { return PackDirectory(*arguments); };
+}
+
+struct SendArguments {
+  std::string file;
+  std::string time;
+};
+
+// An archive is finished soon after its run began, which is what the server wants to know.
+int64_t TimeOfFile(const std::string& path) {
+  struct stat status = {};
+  return stat(path.c_str(), &status) == 0 ? status.st_mtime : time(nullptr);
+}
+
+Result SendArchive(const SendArguments& arguments) {
+  const int64_t moment =
+      arguments.time.empty() ? TimeOfFile(arguments.file) : ReadMoment("--time", arguments.time);
+  Result result;
+  result.success = QUENDELSendCollectData(arguments.file.c_str(), moment) == 0;
+  result.lines = {result.success ? "The server accepted " + arguments.file + "."
+                                 : "The server did not get or accept " + arguments.file + "."};
+  result.members["file"] = arguments.file;
+  result.members["timestamp"] = static_cast<Json::Int64>(moment);
+  return result;
+}
+
+Action DeclareSend(CLI::App& command) {
+  const auto arguments = std::make_shared<SendArguments>();
+  command.add_option("FILE", arguments->file, "Archive of a collection run")
+      ->required()
+      ->type_name("");
+  command
+      .add_option("--time", arguments->time,
+                  "When the run began, in seconds since the epoch; the time of\n"
+                  "the file's last change if not given")
+      ->type_name("SECONDS");
+  return [arguments] { return SendArchive(*arguments); };
+}
+
+}  // namespace
+
+std::vector<Command> CollectionCommands() {
+  return {
+      {"collect", "Gather what is new in the logs and collectors, pack it, and send it if asked",
+       R"(What was gathered counts as collected once the archive is made and, with --send,
+accepted by the server. One collection at a time.
+
+Examples:
+  quendelctl collect --send
+  quendelctl collect --keep
+  quendelctl perf --series 12 --every 5 | quendelctl collect --send --perf -)",
+       DeclareCollect},
+      {"tar", "Pack a directory the way a collection does",
+       R"(Example:
+  quendelctl tar /tmp/quendel_20240305_070809_0 /tmp/again.tar.xz)",
+       DeclareTar},
+      {"send", "Send the archive of a collection to the server",
+       R"(Examples:
+  quendelctl send /tmp/quendel_20240305_070809_0.tar.xz
+  quendelctl send again.tar.xz --time 1709622489)",
+       DeclareSend},
+  };
+}
+
+}  // namespace quendelctl
