@@ -41,7 +41,9 @@ class FailingAllocation {
 
 }  // namespace
 
-void* operator new(size_t size) {
+// Not inlined: where the compiler sees into only one side of a pair, it takes malloc() and delete,
+// or new and free(), for a mismatch.
+__attribute__((noinline)) void* operator new(size_t size) {
   if (allocationsLeft >= 0 && allocationsLeft-- == 0) {
     throw std::bad_alloc();
   }
@@ -52,11 +54,11 @@ void* operator new(size_t size) {
   return memory;
 }
 
-void operator delete(void* memory) noexcept {
+__attribute__((noinline)) void operator delete(void* memory) noexcept {
   free(memory);
 }
 
-void operator delete(void* memory, size_t /*size*/) noexcept {
+__attribute__((noinline)) void operator delete(void* memory, size_t /*size*/) noexcept {
   free(memory);
 }
 
