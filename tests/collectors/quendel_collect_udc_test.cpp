@@ -342,6 +342,27 @@ TEST(CollectUDCTest, SendsErrorForAProgramThatDoesNotStart) {
                                    "Failed to popen '" + PathOf("b") + "'", NoResultOf("b")));
 }
 
+TEST(CollectUDCTest, SendsErrorForOutputThatCannotBeReadToItsEnd) {
+  Install("a", "");
+  // A stream that gives a valid result, and then an error where its end should be.
+  cookie_io_functions_t functions = {};
+  functions.read = [](void* calls, char* buffer, size_t) -> ssize_t {
+    if (++*static_cast<int*>(calls) > 1) {
+      errno = EIO;
+      return -1;
+    }
+    buffer[0] = '1';
+    return 1;
+  };
+  int calls = 0;
+  FILE* stream = fopencookie(&calls, "r", functions);
+  FailCall("ALIBCPopen", 1, reinterpret_cast<long>(stream));
+  EXPECT_EQ(Collect(), 0);
+  EXPECT_EQ(Results(), Parsed(R"({"a": "Error"})"));
+  EXPECT_THAT(Log(), LoggedInOrder(NoResultOf("a")));
+  fclose(stream);
+}
+
 TEST(CollectUDCTest, TakesALoopOfLinksForAMissingProgram) {
   Install("a", "");
   RemoveFile(PathOf("a"));

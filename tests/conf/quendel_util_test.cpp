@@ -56,6 +56,12 @@ TEST(FileCopyTest, CopiesAFile) {
   EXPECT_EQ(ReadFile("/tmp/to"), bytes);
 }
 
+TEST(FileCopyTest, SetsTwoFlagsOfThePlatformsOptions) {
+  Record("ARVOFileCopy");
+  QUENDELFileCopy("/tmp/from", "/tmp/to");
+  EXPECT_THAT(Recorded(), ElementsAre("/tmp/from|/tmp/to|1,0,1,0,0,0,0,0,0,0,0,0,0,0,0,0,0,0,0,0"));
+}
+
 TEST(FileCopyTest, PassesThePlatformsAnswerOnInSilence) {
   FailCall("ARVOFileCopy", 1, -42);
   EXPECT_EQ(QUENDELFileCopy("/tmp/from", "/tmp/to"), -42);
@@ -79,9 +85,8 @@ TEST(RecursiveMkdirTest, WritesTheModeInOctalWithoutALeadingZero) {
   QUENDELRecursiveMkdir("/x", 01777);
   QUENDELRecursiveMkdir("/x", 0);
   QUENDELRecursiveMkdir("/x", 0123456712);  // cut to seven digits
-  EXPECT_THAT(Recorded(),
-              ElementsAre("/bin/mkdir|-p|/x|-m|755", "/bin/mkdir|-p|/x|-m|1777",
-                          "/bin/mkdir|-p|/x|-m|0", "/bin/mkdir|-p|/x|-m|1234567"));
+  EXPECT_THAT(Recorded(), ElementsAre("/bin/mkdir|-p|/x|-m|755", "/bin/mkdir|-p|/x|-m|1777",
+                                      "/bin/mkdir|-p|/x|-m|0", "/bin/mkdir|-p|/x|-m|1234567"));
 }
 
 TEST(RecursiveMkdirTest, RunsNothingForTheCurrentDirectoryAndTheRoot) {
@@ -186,5 +191,9 @@ TEST(HexToBytesTest, ReadsWhatIsNoNumberAsFarAsItIsOne) {
   EXPECT_EQ(Bytes("-1", 8), "\xff");
   EXPECT_EQ(Bytes(" 7", 8), "\x07");
   EXPECT_EQ(Bytes("0x", 8), std::string(1, '\0'));
-  EXPECT_EQ(Bytes(std::string("1\0" "22", 4), 8), "\x01\x22");
+  EXPECT_EQ(Bytes(std::string("1\0"
+                              "22",
+                              4),
+                  8),
+            "\x01\x22");
 }

@@ -1,6 +1,7 @@
 // The appliance's own operations, which a test can make fail.
 #include <array>
 #include <cstdarg>
+#include <string>
 
 #include "base/json_text.h"
 #include "platform/account.h"
@@ -67,8 +68,6 @@ QUENDEL_WRAP(int, ALIBCFileStat, (const char* path, int flags, struct stat* stat
              status);
 QUENDEL_WRAP(int, ALIBCFileTouch, (const char* path), path);
 QUENDEL_WRAP(int, ALIBCopyRemoveDir, (const char* path), path);
-QUENDEL_WRAP(int, ARVOFileCopy, (const char* src, const char* dst, const void* options), src, dst,
-             options);
 
 QUENDEL_WRAP(int, ARVOFSMkdirP,
              (const char* path, int flag, int parents, int uid, int gid, unsigned int mode), path,
@@ -103,6 +102,16 @@ CommandLine TakeCommandLine(const char* program, va_list arguments) {
   return line;
 }
 
+// The 80 bytes of a copy's options, as 32-bit numbers.
+std::string DescribeCopyOptions(const void* options) {
+  std::string text;
+  const auto* words = static_cast<const unsigned*>(options);
+  for (int i = 0; options != nullptr && i < 20; ++i) {
+    text += (i == 0 ? "" : ",") + std::to_string(words[i]);
+  }
+  return text;
+}
+
 }  // namespace
 
 extern "C" {
@@ -114,6 +123,14 @@ int __wrap_ARVOLocalAccountUserDelete(const char* const* names, int count, ALIBC
   const quendel::test::WrappedCall call("ARVOLocalAccountUserDelete", names[0], count);
   return call.fails() ? call.result<int>()
                       : __real_ARVOLocalAccountUserDelete(names, count, result);
+}
+
+QUENDEL_WRAP_BY_HAND(ARVOFileCopy);
+int __real_ARVOFileCopy(const char* src, const char* dst, const void* options);
+int __wrap_ARVOFileCopy(const char* src, const char* dst, const void* options) {
+  const std::string words = DescribeCopyOptions(options);
+  const quendel::test::WrappedCall call("ARVOFileCopy", src, dst, words.c_str());
+  return call.fails() ? call.result<int>() : __real_ARVOFileCopy(src, dst, options);
 }
 
 QUENDEL_WRAP_BY_HAND(ALIBCExec);
