@@ -158,7 +158,9 @@ TEST_F(EventCommandTest, RejectsADescriptionThatIsNotJson) {
   for (const char* info : {"{", "{}x", "{\"a\":1,}", "/tmp/bad.json", "/dev/null"}) {
     const Output output = Quendelctl({"event", "enable", "--info", info});
     EXPECT_EQ(output.status, 2) << info;
-    EXPECT_THAT(output.err, HasSubstr("--info: not JSON: ")) << info;
+    EXPECT_THAT(output.err, ContainsRegex("^quendelctl: --info: not JSON: [^\n]+\n[^\n]+\n"
+                                          "Run with --help for more information\\.\n$"))
+        << info;
   }
   EXPECT_THAT(Requests(), IsEmpty());
 }

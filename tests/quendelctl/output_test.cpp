@@ -139,6 +139,16 @@ TEST_F(OutputTest, FailsWhenTheDiskIsFull) {
   }
 }
 
+TEST_F(OutputTest, FailsWhenAPartOfALongOutputFits) {
+  Answer({.body = R"({"success":true,"actions":")", .fill = 30 << 20, .tail = "\"}"});
+  const Output output = Shell(
+      "mkdir /tmp/small && mount -t tmpfs -o size=64k small /tmp/small && "
+      "$quendelctl heartbeat >/tmp/small/out");
+  EXPECT_EQ(output.status, 1);
+  EXPECT_EQ(output.err, "quendelctl: cannot write the output: No space left on device\n");
+  EXPECT_EQ(ReadFile("/tmp/small/out").size(), 65536U);
+}
+
 TEST_F(OutputTest, FailsWhenNobodyReadsThePipe) {
   const Output output =
       Shell("{ sleep 0.2; $quendelctl version; echo $? >/tmp/status; } | exec true");
@@ -158,9 +168,13 @@ TEST_F(OutputTest, IsAsItShouldBeWhenTheOtherDescriptorsAreClosed) {
   EXPECT_THAT(output.out, Not(IsEmpty()));
 }
 
-TEST_F(OutputTest, FailsWithoutARoomForTheLogLinesProcess) {
-  const Output output = Shell("ulimit -n 4; $quendelctl version");
-  EXPECT_EQ(output.status, 1);
-  EXPECT_THAT(output.out, IsEmpty());
-  EXPECT_THAT(output.err, HasSubstr("Too many open files"));
+TEST_F(OutputTest, FailsWhenTheLogLinesCannotBeMadeSafe) {
+  const Output noPipe = Shell("ulimit -n 4; $quendelctl version");
+  EXPECT_EQ(noPipe.status, 1);
+  EXPECT_THAT(noPipe.out, IsEmpty());
+  EXPECT_EQ(noPipe.err, "quendelctl: cannot make a pipe: Too many open files\n");
+  const Output noCopy = Shell("ulimit -n 5; $quendelctl version");
+  EXPECT_EQ(noCopy.status, 1);
+  EXPECT_THAT(noCopy.out, IsEmpty());
+  EXPECT_EQ(noCopy.err, "quendelctl: cannot keep the standard error output: Too many open files\n");
 }

@@ -11,7 +11,7 @@ namespace quendelctl {
 namespace {
 
 std::vector<std::string> DescribeActions(const Json::Value& actions) {
-  if (actions.empty() && !actions.isString()) {  // null too counts as empty
+  if (actions.empty()) {  // null, or an array or object that holds nothing
     return {"The server has queued no actions."};
   }
   if (!actions.isArray()) {

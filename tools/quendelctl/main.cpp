@@ -79,7 +79,6 @@ int AnswerParser(const CLI::App& app, const CLI::ParseError& error) {
     fprintf(stderr, "quendelctl: %s", complaint.str().c_str());
   }
   PrintText(out.str());
-  FinishOutput();
   return code == 0 ? kExitSuccess : kExitUsage;
 }
 
@@ -94,7 +93,6 @@ int Run(int argc, char** argv) {
     }
     const Result result = request.action();
     PrintResult(result, request.json);
-    FinishOutput();
     return result.success ? kExitSuccess : kExitFailed;
   } catch (const CLI::ParseError& error) {
     return AnswerParser(app, error);

@@ -2,9 +2,9 @@
 #include "output.h"
 
 #include <json/writer.h>
+#include <unistd.h>
 
 #include <cerrno>
-#include <cstdio>
 #include <sstream>
 #include <system_error>
 
@@ -44,15 +44,14 @@ void PrintResult(const Result& result, bool json) {
   }
 }
 
-void PrintText(const std::string& text) {
-  fwrite(text.data(), 1, text.size(), stdout);  // FinishOutput() tells whether it got there
-}
-
-void FinishOutput() {
-  errno = 0;
-  const bool failed = fflush(stdout) != 0 || ferror(stdout) != 0;
-  if (failed || fclose(stdout) != 0) {
-    throw std::system_error(errno, std::generic_category(), "cannot write the output");
+void PrintText(std::string_view text) {
+  while (!text.empty()) {
+    const ssize_t written = write(STDOUT_FILENO, text.data(), text.size());
+    if (written >= 0) {
+      text.remove_prefix(static_cast<size_t>(written));
+    } else if (errno != EINTR) {
+      throw std::system_error(errno, std::generic_category(), "cannot write the output");
+    }
   }
 }
 

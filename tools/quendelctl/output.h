@@ -1,10 +1,11 @@
-// What the program writes to the standard output.
+// What the program writes to the standard output. Whatever does not get there throws.
 #ifndef QUENDELCTL_OUTPUT_H_
 #define QUENDELCTL_OUTPUT_H_
 
 #include <json/value.h>
 
 #include <string>
+#include <string_view>
 #include <vector>
 
 #include "command.h"
@@ -15,10 +16,7 @@ namespace quendelctl {
 void PrintResult(const Result& result, bool json);
 
 // Prints a text of the program's own as it is.
-void PrintText(const std::string& text);
-
-// Closes the standard output. Throws when anything of what was printed did not get there.
-void FinishOutput();
+void PrintText(std::string_view text);
 
 // Returns the value's JSON text on one line, for a reader: characters beyond ASCII stay what they
 // are.

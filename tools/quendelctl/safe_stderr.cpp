@@ -97,10 +97,14 @@ void Show(int input, int output) {
 
 }  // namespace
 
-SafeStderr::SafeStderr() : original_(fcntl(STDERR_FILENO, F_DUPFD_CLOEXEC, 3)) {
+SafeStderr::SafeStderr() {
   int ends[2];
-  if (original_ < 0 || pipe2(ends, O_CLOEXEC) != 0) {
+  if (pipe2(ends, O_CLOEXEC) != 0) {
     Fail("cannot make a pipe");
+  }
+  original_ = fcntl(STDERR_FILENO, F_DUPFD_CLOEXEC, 0);
+  if (original_ < 0) {
+    Fail("cannot keep the standard error output");
   }
   filter_ = fork();
   if (filter_ < 0) {
