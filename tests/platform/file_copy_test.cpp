@@ -9,11 +9,22 @@
 #include <random>
 #include <string>
 
+#include "failing_call.h"
 #include "platform/error.h"
 #include "platform/file.h"
 #include "support/appliance.h"
 
 using namespace quendel::test;
+
+QUENDEL_FAILING_CALL(ssize_t, copy_file_range,
+                     (int from, off_t* fromPlace, int to, off_t* toPlace, size_t size,
+                      unsigned flags),
+                     from, fromPlace, to, toPlace, size, flags)
+QUENDEL_FAILING_CALL(off_t, lseek, (int fd, off_t place, int from), fd, place, from)
+QUENDEL_FAILING_CALL(ssize_t, pread, (int fd, void* buf, size_t size, off_t place), fd, buf, size,
+                     place)
+QUENDEL_FAILING_CALL(ssize_t, pwrite, (int fd, const void* buf, size_t size, off_t place), fd, buf,
+                     size, place)
 
 namespace {
 
@@ -148,6 +159,54 @@ TEST(FileCopyTest, CopiesBetweenFileSystems) {
   WriteFile(kFrom, bytes);
   EXPECT_EQ(ARVOFileCopy(kFrom, "/tmp/other/to", nullptr), 0);
   EXPECT_TRUE(ReadFile("/tmp/other/to") == bytes);
+}
+
+TEST(FileCopyTest, ReadsAndWritesWhereTheKernelCannotCopy) {
+  const std::string bytes = RandomBytes(700000);
+  WriteFile(kFrom, bytes);
+  for (const int reason : {EXDEV, EINVAL, ENOSYS, EOPNOTSUPP, EPERM, EIO, EINTR}) {
+    copy_file_rangeCalls.Fail(1, -1, reason);
+    EXPECT_EQ(Copy(), 0);
+    EXPECT_TRUE(ReadFile(kTo) == bytes) << reason;
+  }
+  // Some file systems tell nothing but that they copied nothing.
+  copy_file_rangeCalls.Fail(1, 0);
+  EXPECT_EQ(Copy(), 0);
+  EXPECT_TRUE(ReadFile(kTo) == bytes);
+}
+
+TEST(FileCopyTest, CopiesInTheKernelWhereItCan) {
+  WriteFile(kFrom, RandomBytes(700000));
+  EXPECT_EQ(Copy(), 0);
+  EXPECT_GT(copy_file_rangeCalls.calls(), 0);
+  EXPECT_EQ(preadCalls.calls(), 0);
+}
+
+TEST(FileCopyTest, IsNotDisturbedBySignals) {
+  const std::string bytes = RandomBytes(700000);
+  WriteFile(kFrom, bytes);
+  copy_file_rangeCalls.Fail(1, -1, EXDEV);
+  preadCalls.Fail(2, -1, EINTR);
+  pwriteCalls.Fail(2, -1, EINTR);
+  EXPECT_EQ(Copy(), 0);
+  EXPECT_TRUE(ReadFile(kTo) == bytes);
+}
+
+TEST(FileCopyTest, CopiesWhereTheFileSystemKnowsNoHoles) {
+  const std::string bytes = RandomBytes(700000);
+  WriteFile(kFrom, bytes);
+  lseekCalls.Fail(1, -1, EINVAL);
+  EXPECT_EQ(Copy(), 0);
+  EXPECT_TRUE(ReadFile(kTo) == bytes);
+}
+
+TEST(FileCopyTest, EndsWhereASourceThatShrankEnds) {
+  WriteFile(kFrom, RandomBytes(700000));
+  lseekCalls.Fail(0, -1, EINVAL);
+  copy_file_rangeCalls.Fail(1, -1, EXDEV);
+  preadCalls.Fail(1, 0);  // the end, earlier than the size told
+  EXPECT_EQ(Copy(), 0);
+  EXPECT_EQ(StatusOf(kTo).st_size, 0);
 }
 
 TEST(FileCopyTest, CopiesAFileThatTellsNoSize) {

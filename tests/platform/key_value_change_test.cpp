@@ -17,6 +17,7 @@
 #include <vector>
 
 #include "containers.h"
+#include "failing_call.h"
 #include "platform/error.h"
 #include "platform/key_value.h"
 #include "platform/owned.h"
@@ -25,6 +26,9 @@
 using namespace quendel::test;
 using testing::ElementsAre;
 using testing::IsEmpty;
+
+QUENDEL_FAILING_CALL(int, fsync, (int fd), fd)
+QUENDEL_FAILING_CALL(int, flock, (int fd, int operation), fd, operation)
 
 namespace {
 
@@ -332,6 +336,62 @@ TEST(FileSetKeyValueTest, LeavesTheOldFileInAReadOnlyDirectory) {
   EXPECT_EQ(Set("key", "new"), -1);
   EXPECT_EQ(ALIBCErrGet(), 0x0500);
   EXPECT_EQ(errno, EROFS);
+  EXPECT_EQ(ReadFile(kPath), "key=old\n");
+}
+
+TEST(FileSetKeyValueTest, LeavesTheOldFileWhenTheNewOneCannotBeSynchronised) {
+  WriteFile(kPath, "key=old\n");
+  fsyncCalls.Fail(1, -1, EIO);
+  EXPECT_EQ(Set("key", "new"), -1);
+  EXPECT_EQ(ALIBCErrGet(), 0x0600);
+  EXPECT_EQ(errno, EIO);
+  EXPECT_EQ(ReadFile(kPath), "key=old\n");
+  EXPECT_THAT(NamesIn(kDir), ElementsAre("test.conf"));
+}
+
+TEST(FileSetKeyValueTest, TellsThatTheFolderCouldNotBeSynchronised) {
+  WriteFile(kPath, "key=old\n");
+  fsyncCalls.Fail(2, -1, EIO);
+  EXPECT_EQ(Set("key", "new"), -1);
+  EXPECT_EQ(ALIBCErrGet(), 0x0601);
+  EXPECT_EQ(ReadFile(kPath), "key=new\n");
+  // What is not written again is synchronised all the same.
+  fsyncCalls.Fail(1, -1, EIO);
+  EXPECT_EQ(Set("key", "new"), -1);
+  EXPECT_EQ(ALIBCErrGet(), 0x0601);
+}
+
+TEST(FileSetKeyValueTest, TakesAFileSystemThatCannotSynchroniseFolders) {
+  WriteFile(kPath, "key=old\n");
+  fsyncCalls.Fail(2, -1, EINVAL);
+  EXPECT_EQ(Set("key", "new"), 1);
+}
+
+TEST(FileSetKeyValueTest, LeavesTheOldFileWhenTheNewOneCannotTakeItsPlace) {
+  WriteFile(kPath, "key=old\n");
+  // What is mounted cannot be replaced.
+  ASSERT_EQ(mount(kPath, kPath, nullptr, MS_BIND, nullptr), 0);
+  EXPECT_EQ(Set("key", "new"), -1);
+  EXPECT_EQ(ALIBCErrGet(), 0x0600);
+  EXPECT_EQ(errno, EBUSY);
+  EXPECT_EQ(ReadFile(kPath), "key=old\n");
+  EXPECT_THAT(NamesIn(kDir), ElementsAre("test.conf"));
+}
+
+TEST(FileSetKeyValueTest, FailsWithoutALock) {
+  WriteFile(kPath, "key=old\n");
+  flockCalls.Fail(1, -1, ENOLCK);
+  EXPECT_EQ(Set("key", "new"), -1);
+  EXPECT_EQ(ALIBCErrGet(), 0x0500);
+  EXPECT_EQ(errno, ENOLCK);
+  EXPECT_EQ(ReadFile(kPath), "key=old\n");
+}
+
+TEST(FileSetKeyValueTest, FailsWhenWhatAKilledProcessLeftCannotBeRemoved) {
+  WriteFile(kPath, "key=old\n");
+  mkdir("/tmp/settings/.test.conf.new", 0700);
+  EXPECT_EQ(Set("key", "new"), -1);
+  EXPECT_EQ(ALIBCErrGet(), 0x0600);
   EXPECT_EQ(ReadFile(kPath), "key=old\n");
 }
 

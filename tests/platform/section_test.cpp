@@ -13,6 +13,7 @@
 #include <vector>
 
 #include "containers.h"
+#include "failing_call.h"
 #include "platform/error.h"
 #include "platform/key_value.h"
 #include "platform/owned.h"
@@ -22,6 +23,9 @@ using namespace quendel::test;
 using testing::ElementsAre;
 using testing::IsEmpty;
 using testing::Pair;
+
+QUENDEL_FAILING_CALL(int, flock, (int fd, int operation), fd, operation)
+QUENDEL_FAILING_CALL(int, ftruncate, (int fd, off_t size), fd, size)
 
 namespace {
 
@@ -150,6 +154,24 @@ TEST(FileAddSectionTest, TakesAPartBackOnAFullDisk) {
   EXPECT_EQ(errno, ENOSPC);
   EXPECT_EQ(ReadFile(kPath), before);
   EXPECT_THAT(Sections(), ElementsAre("a"));
+}
+
+TEST(FileAddSectionTest, SaysWhenAPartCannotBeTakenBack) {
+  mkdir(kDir, 0700);
+  ASSERT_EQ(mount("small", kDir, "tmpfs", 0, "size=4k"), 0);
+  ASSERT_GT(Add("a", {{"x", std::string(3000, 'x')}}), 0);
+  ftruncateCalls.Fail(1, -1, EROFS);
+  EXPECT_LT(Add("b", {{"y", std::string(3000, 'y')}}), 0);
+  EXPECT_EQ(ALIBCErrGet(), 0x0600);
+  EXPECT_EQ(errno, EIO);
+  EXPECT_THAT(Sections(), ElementsAre("a"));
+}
+
+TEST(FileAddSectionTest, FailsWithoutALock) {
+  flockCalls.Fail(1, -1, ENOLCK);
+  EXPECT_LT(Add("a", kState), 0);
+  EXPECT_EQ(ALIBCErrGet(), 0x0500);
+  EXPECT_FALSE(Exists(kPath));
 }
 
 TEST(FileAddSectionTest, KeepsTheSectionsOfManyProcessesWhole) {

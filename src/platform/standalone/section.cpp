@@ -40,7 +40,6 @@ struct Range {
 // The whole sections of one file, as they stood when this thread last read it. A commit asks for
 // one section after the other: without this, each would cost reading the whole file.
 struct SectionIndex {
-  std::string path;
   struct stat status = {};
   std::string text;
   std::vector<std::string> names;
@@ -118,8 +117,7 @@ bool IsUnchanged(const struct stat& a, const struct stat& b) {
 
 bool IsIndexed(const char* path) {
   struct stat status;
-  return lastIndex && lastIndex->path == path && stat(path, &status) == 0 &&
-         IsUnchanged(lastIndex->status, status);
+  return lastIndex && stat(path, &status) == 0 && IsUnchanged(lastIndex->status, status);
 }
 
 // Returns the index of a file, or null with the last error set when the file cannot be read.
@@ -129,7 +127,6 @@ const SectionIndex* IndexOf(const char* path) {
   }
   lastIndex.reset();
   auto index = std::make_unique<SectionIndex>();
-  index->path = path;
   const Descriptor file = OpenRegularFile(path, &index->status);
   if (!file || !ReadToEnd(file.get(), index->status.st_size, index->text)) {
     return nullptr;
