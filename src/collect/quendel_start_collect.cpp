@@ -227,7 +227,7 @@ bool WaitForChildren(Run& run, int limitSeconds) {
       QUENDEL_LOG("Error happened when wait all children done");
       return false;
     }
-    if (run.udc.finished && run.log.finished && secondsWaited < limitSeconds) {
+    if (run.udc.finished && run.log.finished) {
       return true;
     }
   }
