@@ -15,10 +15,10 @@
 #include "support/server.h"
 
 using namespace quendel::test;
+using testing::_;
 using testing::AnyOf;
 using testing::Each;
 using testing::EndsWith;
-using testing::HasSubstr;
 using testing::IsEmpty;
 using testing::Matcher;
 using testing::Not;
@@ -34,7 +34,7 @@ std::function<void(int)> LogsOnly(const Matcher<std::string>& message) {
       EXPECT_EQ(result, -1);
       EXPECT_THAT(Log(), Not(IsEmpty()));
     }
-    EXPECT_THAT(Log(), Each(Logged(testing::_, message)));
+    EXPECT_THAT(Log(), Each(Logged(_, message)));
   };
 }
 
@@ -49,11 +49,17 @@ TEST(NoMemoryTest, IsAFailedTransferOfAFilePost) {
   WriteFile("/tmp/a.txt", "a");
   QUENDELSendDataParam_t item;
   item.path = "/tmp/a.txt";
+  bool undescribed = false;
   WithEachAllocationFailing(
       [&] { return QUENDELPostFileToServer("https://support.test/a", "file", item, Describe); },
-      LogsOnly(AnyOf("Failed to allocate memory for curl",
-                     "Failed to gen file metadata: '/tmp/a.txt'", StartsWith("CURL Error("),
-                     "Failed to parse response", StartsWith("Failed to handle response: ["))));
+      [&](int result) {
+        LogsOnly(AnyOf("Failed to allocate memory for curl",
+                       "Failed to gen file metadata: '/tmp/a.txt'", StartsWith("CURL Error("),
+                       "Failed to parse response",
+                       StartsWith("Failed to handle response: [")))(result);
+        undescribed = undescribed || result == 0;
+      });
+  EXPECT_TRUE(undescribed) << "a description takes memory, and costs only itself";
 }
 
 TEST(NoMemoryTest, IsAFailedAnswerOfThePerformanceService) {
@@ -66,11 +72,14 @@ TEST(NoMemoryTest, IsAFailedAnswerOfThePerformanceService) {
 TEST(NoMemoryTest, IsAFailedWriteOfPerformanceFiles) {
   WriteFile("/tmp/perf/.keep", "");
   const Json::Value series = PerfSeries();
+  bool only_one = false;
   WithEachAllocationFailing([&] { return QUENDELParsePerfJson("/tmp/perf", series); },
-                            [](int result) {
+                            [&](int result) {
                               EXPECT_EQ(result, -1);
-                              LogsOnly(EndsWith(" perf data"))(result);
+                              EXPECT_THAT(Log(), Each(Logged(_, EndsWith(" perf data"))));
+                              only_one = only_one || Log().size() == 1;
                             });
+  EXPECT_TRUE(only_one) << "a file takes memory, and costs only itself";
 }
 
 TEST(NoMemoryTest, IsAFailedPacking) {
