@@ -35,8 +35,8 @@ QUENDEL_EXPORT int QUENDELUploadFile(int actionId, QuendelActionProgress_t progr
                                      const Json::Value& files);
 
 // Sends files to the server in one post, as the answer to its request `actionId`, of which 7
-// characters count. Each file goes with its name, type, uuid and timestamp; a file that cannot be
-// added drops out. An empty list is posted too. The files are left as they are.
+// characters count. Each file goes with its name, type, uuid and timestamp; one that cannot be
+// opened fails the whole post. An empty list is posted too. The files are left as they are.
 //
 // Needs a signed-in cloud account.
 //
@@ -57,7 +57,7 @@ QUENDEL_EXPORT int QUENDELSupportAccountUserCreate(const char* user, const char*
 // Removes the support account's home, "/run/quendelhome", and then the local account `user`. Either
 // may be gone already. Needs root.
 //
-// Returns 0 when the account no longer exists, else -1.
+// Returns 0 when the removal of the home was run and the account no longer exists, else -1.
 QUENDEL_EXPORT int QUENDELSupportAccountUserDelete(const char* user);
 
 // Ends a support session: deletes its account and home, reports `progress` for the server's request
@@ -72,7 +72,8 @@ QUENDEL_EXPORT int QUENDELSupportAccountUserDelete(const char* user);
 // refused and changes nothing. The file goes last, so a call that failed can be repeated. Needs
 // root.
 //
-// Returns 0 when the file was removed, else -1.
+// Returns 0 when the account is gone, the server was told and the removal of the file was run, else
+// -1.
 QUENDEL_EXPORT int QUENDELRemoteClose(int actionId, QuendelActionProgress_t progress);
 
 // Reads the key of the current remote session from the platform's authentication tool, at most

@@ -2,7 +2,9 @@
 #include <gmock/gmock.h>
 #include <sys/stat.h>
 
-#include <cerrno>
+#include <algorithm>
+#include <iterator>
+#include <random>
 #include <string>
 
 #include "base/json_text.h"
@@ -279,6 +281,131 @@ TEST_F(UploadFileTest, BearsAPathOfOneMebibyte) {
   EXPECT_EQ(Upload(List({File("coredump", longPath + "x")})), -1);
   EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Invalid file path '" + longPath + "x'"),
                                  Logged(kUnit, "Validate filepath failed")));
+}
+
+// Any JSON at all, with a liking for what nearly passes.
+class AnyRequest {
+ public:
+  explicit AnyRequest(unsigned int seed) : random_(seed) {}
+
+  Json::Value Files() {
+    if (Pick(8) == 0) {
+      return Value(3);
+    }
+    Json::Value files(Json::arrayValue);
+    // One bad element fails all, so most lists are short.
+    for (int count = Pick(3) == 0 ? Pick(7) : 1; count > 0; --count) {
+      files.append(Pick(16) == 0 ? Value(2) : Element());
+    }
+    return files;
+  }
+
+ private:
+  int Pick(int choices) { return std::uniform_int_distribution<int>(0, choices - 1)(random_); }
+
+  Json::Value Element() {
+    Json::Value element(Json::objectValue);
+    for (const char* key : {"file_path", "file_type", "file_uuid"}) {
+      if (Pick(10) != 0) {
+        element[key] = Pick(10) == 0 ? Value(2) : Json::Value(Text());
+      }
+    }
+    return element;
+  }
+
+  Json::Value Value(int depth) {
+    switch (Pick(depth > 0 ? 8 : 6)) {
+      case 0:
+        return Json::Value();
+      case 1:
+        return Pick(2) == 0;
+      case 2:
+        return Pick(1000) - 500;
+      case 3:
+        return 1e308 * Pick(3);
+      case 6: {
+        Json::Value list(Json::arrayValue);
+        for (int count = Pick(4); count > 0; --count) {
+          list.append(Value(depth - 1));
+        }
+        return list;
+      }
+      case 7:
+        return Element();
+      default:
+        return Text();
+    }
+  }
+
+  std::string Text() {
+    static const std::string pieces[] = {"/var/crash/", "/volume1/",
+                                         "/volume12/",  "/volume/",
+                                         "@",           "@",
+                                         "a",           ".core",
+                                         ".core",       "/",
+                                         "..",          "\n",
+                                         "core",        std::string(1, '\0'),
+                                         "\xff\xfe",    "debug.dat",
+                                         "coredump",    "/etc/passwd",
+                                         "%s%n",        ";rm",
+                                         "-rf"};
+    if (Pick(3) == 0) {
+      return Pick(2) == 0 ? "debug.dat" : "coredump";
+    }
+    static const char* const fronts[] = {"", "/var/crash/@", "/volume1/@", "/etc/var/crash/@"};
+    std::string text = fronts[Pick(4)];
+    for (int count = Pick(5); count > 0; --count) {
+      text += pieces[Pick(static_cast<int>(std::size(pieces)))];
+    }
+    return text + (Pick(4) == 0 ? "" : ".core");
+  }
+
+  std::mt19937 random_;
+};
+
+bool IsDumpPath(std::string path) {
+  const auto takeFront = [&path](const std::string& front) {
+    const bool has = path.compare(0, front.size(), front) == 0;
+    path.erase(0, has ? front.size() : 0);
+    return has;
+  };
+  if (!takeFront("/var/crash/")) {
+    if (!takeFront("/volume")) {
+      return false;
+    }
+    const size_t digits = std::min(path.find_first_not_of("0123456789"), path.size());
+    path.erase(0, digits);
+    if (digits == 0 || !takeFront("/")) {
+      return false;
+    }
+  }
+  const std::string end = ".core";
+  return takeFront("@") && path.size() > end.size() &&
+         path.compare(path.size() - end.size(), end.size(), end) == 0;
+}
+
+// Whatever the server asks for, the tools see fixed texts and paths that the pattern allows.
+TEST_F(UploadFileTest, GivesTheToolsNoOtherPathWhateverIsAskedFor) {
+  int compressed = 0;
+  for (unsigned int seed = 0; seed < 20000; ++seed) {
+    SCOPED_TRACE("seed " + std::to_string(seed));
+    StartOver();
+    FailCall("ALIBCExec", 0, 1);
+    FailCall("ALIBCExecl", 0, -1);
+    FailCall("ARVOFSMkdirP", 0, 0);
+    FailCall("ARVOMYHUBAccountGet", 0, -1);
+    const int result = Upload(AnyRequest(seed).Files());
+    EXPECT_EQ(result, -1);  // nothing can be told without an account
+    for (const std::string& command : Recorded()) {
+      if (command.rfind("/bin/xz|-kf|", 0) == 0) {
+        EXPECT_TRUE(IsDumpPath(command.substr(12))) << command;
+        ++compressed;
+      } else {
+        EXPECT_THAT(command, testing::AnyOf(kCollector, kRemoveDumps, kRemoveDebug));
+      }
+    }
+  }
+  EXPECT_GT(compressed, 100);
 }
 
 // ---- How many.
