@@ -35,37 +35,39 @@ Json::Value ReadSeries(const std::string& text) {
   return series;
 }
 
-WorkerEnd Collect(const CollectArguments& arguments, const Json::Value& series, RunWatch& run) {
+// The run keeps its files, so that there is something to tell of; they are removed afterwards.
+WorkerEnd Collect(bool send, const Json::Value& series, RunWatch& run) {
   Progress progress;
-  const WorkerEnd end = RunInWorker(
-      [&] { return QUENDELStartCollect(arguments.keep ? 0 : 1, arguments.send ? 1 : 0, series); },
-      [&](pid_t worker) {
-        run.Look(worker);
-        progress.Show(run);
-      });
+  const WorkerEnd end = RunInWorker([&] { return QUENDELStartCollect(0, send ? 1 : 0, series); },
+                                    [&](pid_t worker) {
+                                      run.Look(worker);
+                                      progress.Show(run);
+                                    });
   progress.Finish();
-  run.Look(0);  // for what came after the last look and is still there
+  run.Settle(end.result.has_value());
   return end;
 }
 
-// A run that was ended in the middle leaves its files, and the files that mark its collectors.
-void CleanUp(const RunWatch& run, bool keep) {
-  if (!keep && !run.Directory().empty()) {
+// A run that was ended in the middle leaves the files that mark its collectors.
+void RemoveStaleMarkers() {
+  constexpr char kMarker[] = "xxx.p.";  // "udc" or "log", then the process id
+  std::error_code error;
+  for (const auto& entry : fs::directory_iterator("/tmp/quendel", error)) {
+    const std::string name = entry.path().filename();
+    if (name.rfind("udc.p.", 0) != 0 && name.rfind("log.p.", 0) != 0) {
+      continue;
+    }
+    const int id = atoi(name.c_str() + strlen(kMarker));
+    if (id > 0 && kill(id, 0) != 0 && errno == ESRCH) {
+      fs::remove(entry.path(), error);
+    }
+  }
+}
+
+void RemoveRun(const RunWatch& run) {
+  if (!run.Directory().empty()) {
     QUENDELRecursiveRmdir(run.Directory().c_str());
     QUENDELRecursiveRmdir(run.Archive().c_str());
-  }
-  for (const char* prefix : {"udc.p.", "log.p."}) {
-    std::error_code error;
-    for (const auto& entry : fs::directory_iterator("/tmp/quendel", error)) {
-      const std::string name = entry.path().filename();
-      if (name.rfind(prefix, 0) != 0) {
-        continue;
-      }
-      const int id = atoi(name.c_str() + strlen(prefix));
-      if (id > 0 && kill(id, 0) != 0 && errno == ESRCH) {
-        fs::remove(entry.path(), error);
-      }
-    }
   }
 }
 
@@ -104,41 +106,39 @@ Json::Value JsonList(const std::set<std::string>& texts) {
   return list;
 }
 
-void TellWhatWasCollected(const CollectArguments& arguments, const RunWatch& run, Result& result) {
-  const std::string size = run.ArchiveBytes() ? std::to_string(*run.ArchiveBytes()) : "";
+void TellWhatWasCollected(bool send, const RunWatch& run, Result& result) {
   result.lines.push_back("The collection is complete.");
-  if (run.logs()) {
-    result.lines.push_back(DescribeLogs(*run.logs()));
-    result.members["logs_collected"] = JsonList(*run.logs());
+  if (!run.Directory().empty()) {
+    const std::set<std::string> logs = run.Logs(1);
+    result.lines.push_back(DescribeLogs(logs));
+    result.members["logs_collected"] = JsonList(logs);
   }
-  if (arguments.send) {
-    result.lines.push_back("The server accepted the archive" +
-                           (size.empty() ? "." : " of " + size + " bytes."));
+  std::string size;
+  if (const auto bytes = run.ArchiveBytes()) {
+    size = " of " + std::to_string(*bytes) + " bytes";
+    result.members["bytes"] = static_cast<Json::UInt64>(*bytes);
+  }
+  if (send) {
+    result.lines.push_back("The server accepted the archive" + size + ".");
     result.members["logs_sent"] = result.members["logs_collected"];
-  }
-  if (run.ArchiveBytes()) {
-    result.members["bytes"] = static_cast<Json::UInt64>(*run.ArchiveBytes());
   }
 }
 
 void TellWhatIsKept(const RunWatch& run, Result& result) {
-  std::error_code error;
-  if (fs::is_directory(run.Directory(), error)) {
+  if (!run.Directory().empty()) {
     result.lines.push_back("Run directory: " + run.Directory());
     result.members["run_directory"] = run.Directory();
   }
-  if (fs::is_regular_file(run.Archive(), error)) {
+  if (run.ArchiveBytes()) {
     result.lines.push_back("Archive: " + run.Archive());
     result.members["archive"] = run.Archive();
-  } else if (result.success) {
-    result.lines.push_back("Which archive in /tmp is this run's cannot be told.");
   }
 }
 
 Result RunCollection(const CollectArguments& arguments) {
   const Json::Value series = ReadSeries(arguments.perf);
   RunWatch run(arguments.send);
-  const WorkerEnd end = Collect(arguments, series, run);
+  const WorkerEnd end = Collect(arguments.send, series, run);
 
   Result result;
   result.success = end.result == 0;
@@ -149,15 +149,20 @@ Result RunCollection(const CollectArguments& arguments) {
   }
   result.members["logs_sent"] = Json::arrayValue;
   if (result.success) {
-    TellWhatWasCollected(arguments, run, result);
+    TellWhatWasCollected(arguments.send, run, result);
   } else {
     result.lines.push_back(DescribeFailure(end));
   }
   if (!end.result) {
-    CleanUp(run, arguments.keep);
+    RemoveStaleMarkers();
+  }
+  if (run.IsAmbiguous()) {
+    result.lines.push_back("Another run made a directory in /tmp meanwhile; both stay there.");
   }
   if (arguments.keep) {
     TellWhatIsKept(run, result);
+  } else {
+    RemoveRun(run);
   }
   return result;
 }
@@ -182,15 +187,15 @@ struct TarArguments {
 
 // The library takes the parent and the last component of a path that has both.
 std::string ReadDirectory(const std::string& text) {
-  std::string path = fs::absolute(text);
+  std::error_code error;
+  std::string path = fs::absolute(text, error);
   path.erase(path.find_last_not_of('/') + 1);
   std::string name = fs::path(path).filename();
   if (name == "." || name == "..") {
-    std::error_code error;
     path = fs::canonical(path, error);
     name = fs::path(path).filename();
   }
-  if (text.empty() || name.empty()) {
+  if (name.empty()) {
     throw CLI::ValidationError("DIR", "a directory that has a name is needed");
   }
   if (name[0] == '-') {  // tar would take it for an option
@@ -201,6 +206,9 @@ std::string ReadDirectory(const std::string& text) {
 
 Result PackDirectory(const TarArguments& arguments) {
   const std::string directory = ReadDirectory(arguments.directory);
+  if (arguments.archive.empty()) {
+    throw CLI::ValidationError("ARCHIVE", "a file name is needed");
+  }
   // tar would take a name with a colon in it for one on another machine, but not a path.
   const std::string archive = fs::absolute(arguments.archive);
   Result result;

@@ -237,9 +237,13 @@ Action DeclareConf(CLI::App& command) {
   reset->add_option("NAME", arguments->name, "A collector's settings file, or the name in it")
       ->type_name("");
   reset->add_flag("--all", arguments->all, "Every collector");
-  command.require_subcommand(1);
-  return
-      [list, arguments] { return list->parsed() ? ListCollectors() : ResetCollectors(*arguments); };
+  command.require_subcommand(0, 1);
+  return [list, reset, arguments] {
+    if (!list->parsed() && !reset->parsed()) {
+      throw CLI::RequiredError("list or reset");
+    }
+    return list->parsed() ? ListCollectors() : ResetCollectors(*arguments);
+  };
 }
 
 }  // namespace

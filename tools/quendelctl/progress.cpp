@@ -33,7 +33,7 @@ std::string InUnits(uint64_t bytes) {
 std::string Describe(const RunWatch& run, std::chrono::seconds elapsed) {
   std::string text = PhaseName(run.phase());
   if (!run.Directory().empty()) {
-    text += ": " + std::to_string(run.CountLogsSoFar()) + " of " +
+    text += ": " + std::to_string(run.Logs(0).size()) + " of " +
             std::to_string(run.CountInstalledLogs()) + " logs, " + InUnits(run.BytesSoFar());
     if (const auto bytes = run.ArchiveBytes()) {
       text += ", archive " + InUnits(*bytes);

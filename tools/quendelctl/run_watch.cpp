@@ -1,12 +1,9 @@
 // What can be seen of a collection run from outside.
 #include "run_watch.h"
 
-#include <fcntl.h>
 #include <sys/stat.h>
-#include <unistd.h>
 
 #include <algorithm>
-#include <cctype>
 #include <cstdio>
 #include <filesystem>
 #include <memory>
@@ -54,14 +51,6 @@ std::string LogName(const std::string& file) {
   return numbered ? file.substr(0, dot) : file;
 }
 
-std::set<std::string> CollectedLogs(const std::string& run) {
-  std::set<std::string> names;
-  ForEachEntry(run + "/log", [&](const fs::directory_entry& entry) {
-    names.insert(LogName(entry.path().filename()));
-  });
-  return names;
-}
-
 // A settings file is replaced by another when it changes, and its folder changes with that.
 timespec SettingsChanged() {
   struct stat status = {};
@@ -73,12 +62,12 @@ bool HaveSettingsChanged(const timespec& before) {
   return now.tv_sec != before.tv_sec || now.tv_nsec != before.tv_nsec;
 }
 
-// Where the kernel does not tell, a process counts as having children.
-bool HasChildren(pid_t process) {
+// Returns nothing where the kernel does not tell.
+std::optional<bool> HasChildren(pid_t process) {
   const std::string id = std::to_string(process);
   const std::string path = "/proc/" + id + "/task/" + id + "/children";
   const std::unique_ptr<FILE, int (*)(FILE*)> file(fopen(path.c_str(), "re"), fclose);
-  return file == nullptr || fgetc(file.get()) != EOF;
+  return file == nullptr ? std::nullopt : std::optional<bool>(fgetc(file.get()) != EOF);
 }
 
 }  // namespace
@@ -109,28 +98,33 @@ RunWatch::RunWatch(bool send)
       phase_(send ? Phase::kCheckingServer : Phase::kStarting) {
 }
 
-RunWatch::~RunWatch() {
-  if (archive_ >= 0) {
-    close(archive_);
-  }
-}
-
 void RunWatch::Look(pid_t worker) {
   if (directories_.empty()) {
-    FindDirectory();
+    FindDirectories();
   }
+  const std::optional<bool> children = HasChildren(worker);
+  started_ = started_ || children.value_or(false);
   if (directories_.empty()) {
     return;
   }
-  OpenArchive();
   Phase phase = Phase::kCollecting;
-  if (archive_ >= 0) {
-    phase = HasChildren(worker) ? Phase::kPacking : send_ ? Phase::kSending : Phase::kCommitting;
+  if (ArchiveBytes()) {
+    const Phase afterPacking = send_ ? Phase::kSending : Phase::kCommitting;
+    phase = children.value_or(true) ? Phase::kPacking : afterPacking;
     if (HaveSettingsChanged(settingsChanged_)) {
       phase = Phase::kCommitting;
     }
   }
   phase_ = std::max(phase_, phase);
+}
+
+// A run has made its directory before it has children, and one that never had both of them does not
+// return. So one of the new directories is its own; before that, all of them may be others'.
+void RunWatch::Settle(bool returned) {
+  directories_.clear();
+  if (returned || started_) {
+    FindDirectories();
+  }
 }
 
 std::string RunWatch::Directory() const {
@@ -143,14 +137,22 @@ std::string RunWatch::Archive() const {
 
 std::optional<uint64_t> RunWatch::ArchiveBytes() const {
   struct stat status = {};
-  if (archive_ < 0 || fstat(archive_, &status) != 0) {
+  if (lstat(Archive().c_str(), &status) != 0 || !S_ISREG(status.st_mode)) {
     return std::nullopt;
   }
   return static_cast<uint64_t>(status.st_size);
 }
 
-size_t RunWatch::CountLogsSoFar() const {
-  return logs_ ? logs_->size() : CollectedLogs(Directory()).size();
+std::set<std::string> RunWatch::Logs(uint64_t leastBytes) const {
+  std::set<std::string> names;
+  ForEachEntry(Directory() + "/log", [&](const fs::directory_entry& entry) {
+    std::error_code error;
+    const uint64_t bytes = entry.file_size(error);
+    if (!error && bytes >= leastBytes) {
+      names.insert(LogName(entry.path().filename()));
+    }
+  });
+  return names;
 }
 
 uint64_t RunWatch::BytesSoFar() const {
@@ -166,23 +168,11 @@ uint64_t RunWatch::BytesSoFar() const {
   return bytes;
 }
 
-void RunWatch::FindDirectory() {
+void RunWatch::FindDirectories() {
   for (const std::string& path : RunDirectories()) {
     if (before_.count(path) == 0) {
       directories_.insert(path);
     }
-  }
-}
-
-// The collectors are done when there is an archive, and what they left stays until the run ends.
-// The open file outlives its name.
-void RunWatch::OpenArchive() {
-  if (archive_ >= 0 || Archive().empty()) {
-    return;
-  }
-  archive_ = open(Archive().c_str(), O_RDONLY | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK);
-  if (archive_ >= 0) {
-    logs_ = CollectedLogs(Directory());
   }
 }
 

@@ -18,47 +18,46 @@ enum class Phase { kStarting, kCheckingServer, kCollecting, kPacking, kSending, 
 // Returns the phase in words: "checking the server".
 const char* PhaseName(Phase phase);
 
-// Follows one run by its files. Make it before the run starts.
+// Follows one run by its files. Make it before the run starts; the run has to keep its files.
 class RunWatch {
  public:
   explicit RunWatch(bool send);
-  ~RunWatch();
-  RunWatch(const RunWatch&) = delete;
-  RunWatch& operator=(const RunWatch&) = delete;
 
-  // Looks at the run, which the process `worker` does. Call it often: a run that keeps nothing has
-  // nothing left to look at when it is over.
+  // Looks at the run, which the process `worker` does.
   void Look(pid_t worker);
+
+  // Makes up its mind when the run is over. `returned` tells whether the run came to its end by
+  // itself. A run directory that may be another run's counts as none from then on.
+  void Settle(bool returned);
 
   Phase phase() const { return phase_; }
 
-  // The run directory and the archive beside it; empty when no run directory was seen, or when it
-  // could be that of one of several runs.
+  // Whether several runs went on at the same time.
+  bool IsAmbiguous() const { return directories_.size() > 1; }
+
+  // The run directory and the archive beside it; empty when there is no run directory, or more than
+  // one that could be it.
   std::string Directory() const;
   std::string Archive() const;
 
-  // The archive's bytes, also when it is gone again; nothing when it was never seen.
+  // The size of the archive; nothing when there is none.
   std::optional<uint64_t> ArchiveBytes() const;
 
-  // The names of the logs that gave something new; nothing when the archive was never seen, since
-  // until then there may be more.
-  const std::optional<std::set<std::string>>& logs() const { return logs_; }
+  // The names of the logs that gave something so far, be it an empty file when `leastBytes` is 0.
+  std::set<std::string> Logs(uint64_t leastBytes) const;
 
   size_t CountInstalledLogs() const { return installedLogs_; }
-  size_t CountLogsSoFar() const;
   uint64_t BytesSoFar() const;
 
  private:
-  void FindDirectory();
-  void OpenArchive();
+  void FindDirectories();
 
   const bool send_;
   const size_t installedLogs_;
   const std::set<std::string> before_;
   const timespec settingsChanged_;
-  std::set<std::string> directories_;  // those that came since, as far as they were looked for
-  int archive_ = -1;                   // descriptor
-  std::optional<std::set<std::string>> logs_;
+  std::set<std::string> directories_;  // those that came since
+  bool started_ = false;               // the run has been seen with children
   Phase phase_;
 };
 

@@ -73,6 +73,7 @@ void CloseStandardStreams() {
   if (null >= 0) {
     dup2(null, STDIN_FILENO);
     dup2(null, STDOUT_FILENO);
+    close(null);
   }
 }
 
@@ -133,10 +134,10 @@ void AwaitGroupEnd(pid_t group) {
 WorkerEnd AwaitEnd(pid_t worker, int report, const Signals& signals,
                    const std::function<void(pid_t)>& look) {
   WorkerEnd end;
-  while (!end.interrupted && !HasEnded(worker)) {
-    look(worker);
+  do {
     end.interrupted = signals.Await() != 0;
-  }
+    look(worker);
+  } while (!end.interrupted && !HasEnded(worker));
   if (!end.interrupted) {
     end.result = ReadReport(report);
   }

@@ -20,7 +20,8 @@ struct WorkerEnd {
 // the collection reaps whatever child it has, and one that fails early ends its process group; here
 // neither touches this program.
 //
-// Calls `look` with the worker's process id about fifty times a second while it works. SIGHUP,
+// Calls `look` with the worker's process id about fifty times a second while it works, and once
+// more before it is ended. SIGHUP,
 // SIGINT, SIGQUIT and SIGTERM end the worker with all that is in its group, and then the function
 // returns. The group is ended as well when the worker died without a result.
 //
