@@ -11,8 +11,9 @@ using testing::IsEmpty;
 
 namespace {
 
-const std::vector<std::string> kCommands = {"heartbeat",       "event", "progress", "server",
-                                            "test-connection", "facts", "version"};
+const std::vector<std::string> kCommands = {
+    "heartbeat", "event",  "progress",        "collect", "tar",    "send",
+    "perf",      "server", "test-connection", "facts",   "version"};
 
 void ExpectUsageError(const std::vector<std::string>& arguments, const std::string& complaint) {
   const Output output = Quendelctl(arguments);
