@@ -85,8 +85,8 @@ QUENDEL_EXPORT int QUENDELIsServerReachable();
 //
 // `meta` describes one file: it gets an empty JSON object to fill and the item, and returns 0, or
 // non-zero when it cannot. A file without a description is posted all the same and the array lacks
-// its entry, so its entries may be fewer than the files. A file that cannot be opened fails the whole
-// post.
+// its entry, so its entries may be fewer than the files. A file that cannot be opened fails the
+// whole post.
 //
 // The certificate and the host name of the server are not verified. The list of parts, some hundred
 // bytes for each file and not the files' contents, is kept until the process exits.
