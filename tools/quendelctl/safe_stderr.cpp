@@ -111,6 +111,7 @@ SafeStderr::SafeStderr() {
     Fail("cannot start a process");
   }
   if (filter_ == 0) {
+    close(STDOUT_FILENO);  // its reader must see the end while the program may still run
     close(ends[1]);
     RunFilter(ends[0], original_);
   }
