@@ -30,17 +30,6 @@ std::string ReadWhole(const std::string& argument, FILE* file, const std::string
   return text;
 }
 
-std::string ReadFileOrStandardInput(const std::string& argument, const std::string& name) {
-  if (name == "-") {
-    return ReadWhole(argument, stdin, "the standard input");
-  }
-  const std::unique_ptr<FILE, int (*)(FILE*)> file(fopen(name.c_str(), "rbe"), fclose);
-  if (file == nullptr) {
-    FailToRead(argument, name);
-  }
-  return ReadWhole(argument, file.get(), name);
-}
-
 template <typename Number>
 bool IsWholly(const std::string& text, Number& number) {
   const char* end = text.data() + text.size();
@@ -66,8 +55,19 @@ int64_t ReadMoment(const std::string& argument, const std::string& text) {
   return seconds;
 }
 
+std::string ReadText(const std::string& argument, const std::string& name) {
+  if (name == "-") {
+    return ReadWhole(argument, stdin, "the standard input");
+  }
+  const std::unique_ptr<FILE, int (*)(FILE*)> file(fopen(name.c_str(), "rbe"), fclose);
+  if (file == nullptr) {
+    FailToRead(argument, name);
+  }
+  return ReadWhole(argument, file.get(), name);
+}
+
 Json::Value ReadJson(const std::string& argument, const std::string& text) {
-  const std::string json = text.rfind('{', 0) == 0 ? text : ReadFileOrStandardInput(argument, text);
+  const std::string json = text.rfind('{', 0) == 0 ? text : ReadText(argument, text);
   Json::CharReaderBuilder builder;
   Json::CharReaderBuilder::strictMode(&builder.settings_);
   builder["strictRoot"] = false;

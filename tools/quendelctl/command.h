@@ -16,6 +16,8 @@ struct Result {
   bool success = false;
   Json::Value members = Json::objectValue;  // printed with --json, together with "success"
   std::vector<std::string> lines;           // printed without; may hold any bytes
+  std::string bytes;                        // likewise, but as they are, to anything but a terminal
+  bool keeps_process = false;               // once it is printed, until a signal ends the process
 };
 
 using Action = std::function<Result()>;
@@ -28,6 +30,9 @@ struct Command {
   // Declares the command's arguments. The action runs once they are read; it may still throw a
   // CLI::ParseError, as long as it has not done anything.
   Action (*declare)(CLI::App& command);
+
+  // A command that only groups these declares nothing itself.
+  std::vector<Command> subcommands = {};
 };
 
 // The families of commands.

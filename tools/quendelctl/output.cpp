@@ -42,6 +42,7 @@ void PrintResult(const Result& result, bool json) {
   for (const std::string& line : result.lines) {
     PrintText(Printable(line) + "\n");
   }
+  PrintText(isatty(STDOUT_FILENO) != 0 ? Printable(result.bytes, "\n\t") : result.bytes);
 }
 
 void PrintText(std::string_view text) {

@@ -12,7 +12,8 @@
 
 namespace quendelctl {
 
-// Prints what came of a command: one line of JSON, in ASCII, or the lines for a reader.
+// Prints what came of a command: one line of JSON, in ASCII, or the lines for a reader and then the
+// bytes, which stay what they are unless they could act on a terminal.
 void PrintResult(const Result& result, bool json);
 
 // Prints a text of the program's own as it is.
