@@ -41,6 +41,9 @@ std::vector<Command> CollectorCommands();
 std::vector<Command> ConversationCommands();
 std::vector<Command> DeviceCommands();
 std::vector<Command> PerformanceCommands();
+std::vector<Command> RemoteCommands();
+std::vector<Command> ShmCommands();
+std::vector<Command> UploadCommands();
 
 }  // namespace quendelctl
 

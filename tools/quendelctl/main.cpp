@@ -28,9 +28,9 @@ constexpr char kFooter[] =
 Exit status: 0 success, 1 the operation failed, 2 the command line is wrong.
 The reasons of a failure go to the standard error output and to the system's log.)";
 
-constexpr std::vector<Command> (*kFamilies[])() = {ConversationCommands, CollectionCommands,
-                                                   PerformanceCommands, CollectorCommands,
-                                                   DeviceCommands};
+constexpr std::vector<Command> (*kFamilies[])() = {
+    ConversationCommands, CollectionCommands, PerformanceCommands, CollectorCommands,
+    UploadCommands,       RemoteCommands,     ShmCommands,         DeviceCommands};
 
 // What the command line asked for.
 struct Request {
