@@ -419,9 +419,10 @@ TEST_F(CollectCommandTest, KeepsWhatAnInterruptedRunHas) {
 
 TEST_F(CollectCommandTest, GoesOnWhenASignalIsIgnored) {
   InstallProgram("raid", "echo $$ > /volume1/collector.pid; sleep 1; echo '{}'");
-  const Output output =
-      Shell("trap '' HUP CHLD; $quendelctl collect & tool=$!; while [ ! -s " +
-            std::string(kPidFile) + " ]; do sleep 0.02; done; kill -HUP $tool; wait $tool");
+  const Output output = Shell(
+      "env --ignore-signal=HUP --ignore-signal=CHLD $quendelctl collect & tool=$!; "
+      "while [ ! -s " +
+      std::string(kPidFile) + " ]; do sleep 0.02; done; kill -HUP $tool; wait $tool");
   EXPECT_EQ(output.status, 0);
   EXPECT_THAT(output.out, StartsWith("The collection is complete.\n"));
 }
@@ -750,6 +751,7 @@ TEST(TarCommandTest, RejectsWhatHasNoNameToPackItUnder) {
   ExpectUsageError({"tar", "", "/volume1/a"}, "DIR: a directory that has a name is needed");
   ExpectUsageError({"tar", "/volume1/-v", "/volume1/a"}, "DIR: the name -v begins with a -");
   ExpectUsageError({"tar", "/volume1"}, "ARCHIVE is required");
+  ExpectUsageError({"tar", "/volume1", ""}, "ARCHIVE: a file name is needed");
   EXPECT_FALSE(Exists("/volume1/a"));
 }
 
