@@ -157,20 +157,6 @@ StreamTable& Streams() {
   return streams;
 }
 
-// Both ends are beyond the three standard streams, whatever this process has closed: setting up the
-// child's streams must not overwrite the end that becomes one of them.
-bool MakePipe(Descriptor& readEnd, Descriptor& writeEnd) {
-  int ends[2];
-  if (pipe2(ends, O_CLOEXEC) != 0) {
-    return false;
-  }
-  const Descriptor lowReadEnd(ends[0]);
-  const Descriptor lowWriteEnd(ends[1]);
-  readEnd.Reset(fcntl(ends[0], F_DUPFD_CLOEXEC, kFirstOtherDescriptor));
-  writeEnd.Reset(fcntl(ends[1], F_DUPFD_CLOEXEC, kFirstOtherDescriptor));
-  return readEnd && writeEnd;
-}
-
 void CloseStream(FILE* stream) {
   const int reason = errno;
   fclose(stream);
@@ -178,12 +164,15 @@ void CloseStream(FILE* stream) {
 }
 
 FILE* OpenStream(const std::vector<char*>& argv) {
-  Descriptor readEnd;
-  Descriptor writeEnd;
-  if (!MakePipe(readEnd, writeEnd)) {
+  int ends[2];
+  if (pipe2(ends, O_CLOEXEC) != 0) {
     Fail(kErrorNotStarted);
     return nullptr;
   }
+  // Whatever this process has closed, the end that the child writes to is never 0, the one stream
+  // that the child opens before it takes that end over: a pipe's read end has the lower number.
+  Descriptor readEnd(ends[0]);
+  const Descriptor writeEnd(ends[1]);
   std::unique_ptr<FILE, void (*)(FILE*)> stream(fdopen(readEnd.get(), "r"), CloseStream);
   if (!stream) {
     Fail(kErrorNoMemory);
