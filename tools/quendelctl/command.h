@@ -30,10 +30,11 @@ struct Command {
   // Declares the command's arguments. The action runs once they are read; it may still throw a
   // CLI::ParseError, as long as it has not done anything.
   Action (*declare)(CLI::App& command);
-
-  // A command that only groups these declares nothing itself.
-  std::vector<Command> subcommands = {};
 };
+
+// Declares the commands of a group, which does nothing itself. Returns what runs the one that was
+// given.
+Action DeclareGroup(CLI::App& group, const std::vector<Command>& commands);
 
 // The families of commands.
 std::vector<Command> CollectionCommands();

@@ -52,13 +52,6 @@ void DeclareJson(CLI::App& command, Request& request) {
 void DeclareCommand(CLI::App& app, const Command& command, Request& request) {
   CLI::App* subcommand = app.add_subcommand(command.name, command.summary);
   subcommand->group("Commands")->footer(command.examples);
-  if (!command.subcommands.empty()) {
-    subcommand->require_subcommand(0, 1);
-    for (const Command& below : command.subcommands) {
-      DeclareCommand(*subcommand, below, request);
-    }
-    return;
-  }
   Action action = command.declare(*subcommand);
   DeclareJson(*subcommand, request);
   subcommand->callback([action, &request] { request.action = action; });
@@ -100,8 +93,11 @@ int Run(int argc, char** argv) {
     }
     const Result result = request.action();
     PrintResult(result, request.json);
-    while (result.keeps_process) {
-      pause();
+    if (result.keeps_process) {
+      close(STDOUT_FILENO);  // its reader need not wait for the process
+      for (;;) {
+        pause();
+      }
     }
     return result.success ? kExitSuccess : kExitFailed;
   } catch (const CLI::ParseError& error) {

@@ -164,33 +164,37 @@ Action DeclareKey(CLI::App& /*command*/) {
   return ShowKey;
 }
 
-}  // namespace
-
-std::vector<Command> RemoteCommands() {
-  const std::vector<Command> commands = {
-      {"create", "Open a session: make the support account and note how to end it",
-       R"(The ssh service is neither started nor asked for: start it before, if it does not run.
+Action DeclareRemote(CLI::App& command) {
+  return DeclareGroup(
+      command,
+      {
+          {"create", "Open a session: make the support account and note how to end it",
+           R"(The ssh service is neither started nor asked for: start it before, if it does not run.
 
 Examples:
   quendelctl remote create support staff.pub
   quendelctl remote create support staff.pub --stop-sshd)",
-       DeclareCreate},
-      {"close", "End the session: delete the account and report to the server",
-       R"(Examples:
+           DeclareCreate},
+          {"close", "End the session: delete the account and report to the server",
+           R"(Examples:
   quendelctl remote close 17
   quendelctl remote close 17 --failed)",
-       DeclareClose},
-      {"key", "Show the key of the current session, which is a secret",
-       R"(The key's bytes are printed as they are, with no line end of their own; a terminal gets those
+           DeclareClose},
+          {"key", "Show the key of the current session, which is a secret",
+           R"(The key's bytes are printed as they are, with no line end of their own; a terminal gets those
 escaped that could act on it. Zero bytes at the end are left out.
 
 Examples:
   quendelctl remote key
   quendelctl remote key --json)",
-       DeclareKey},
-  };
-  return {
-      {"remote", "Open and end a session of the vendor's support staff", "", nullptr, commands}};
+           DeclareKey},
+      });
+}
+
+}  // namespace
+
+std::vector<Command> RemoteCommands() {
+  return {{"remote", "Open and end a session of the vendor's support staff", "", DeclareRemote}};
 }
 
 }  // namespace quendelctl

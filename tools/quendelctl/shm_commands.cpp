@@ -231,30 +231,34 @@ Action DeclareReceive(CLI::App& command) {
   return [arguments] { return Receive(*arguments); };
 }
 
-}  // namespace
-
-std::vector<Command> ShmCommands() {
-  const std::vector<Command> commands = {
-      {"alloc", "Make a segment, or find the one that has this key",
-       R"(Examples:
+Action DeclareShm(CLI::App& command) {
+  return DeclareGroup(
+      command,
+      {
+          {"alloc", "Make a segment, or find the one that has this key",
+           R"(Examples:
   quendelctl shm alloc 0x51 4096
   quendelctl shm alloc 0x51 4096 --hold &)",
-       DeclareAlloc},
-      {"send", "Put a block into a segment and wait 20 seconds for its receiver",
-       R"(Examples:
+           DeclareAlloc},
+          {"send", "Put a block into a segment and wait 20 seconds for its receiver",
+           R"(Examples:
   quendelctl shm send 0x51 block.bin
   echo hello | quendelctl shm send 0x51)",
-       DeclareSend},
-      {"receive", "Wait 20 seconds for a block, show it, and remove the segment",
-       R"(The bytes are printed as they are; a terminal gets those escaped that could act on it.
+           DeclareSend},
+          {"receive", "Wait 20 seconds for a block, show it, and remove the segment",
+           R"(The bytes are printed as they are; a terminal gets those escaped that could act on it.
 
 Examples:
   quendelctl shm receive 0x51 4096 block.bin
   quendelctl shm receive 0x51 6)",
-       DeclareReceive},
-  };
-  return {
-      {"shm", "Hand a block of bytes to another process of this device", "", nullptr, commands}};
+           DeclareReceive},
+      });
+}
+
+}  // namespace
+
+std::vector<Command> ShmCommands() {
+  return {{"shm", "Hand a block of bytes to another process of this device", "", DeclareShm}};
 }
 
 }  // namespace quendelctl
