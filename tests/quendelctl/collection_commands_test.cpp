@@ -373,8 +373,9 @@ TEST_F(CollectCommandTest, LeavesTheGroupOfItsCallerAlone) {
 }
 
 TEST_F(CollectCommandTest, EndsTheCollectorsOfAWorkerThatWasKilled) {
-  InstallProgram("raid", std::string("sleep 0.5; kill -KILL $(cut -d' ' -f4 /proc/$PPID/stat)\n") +
-                             kNeverEnds);
+  InstallProgram("raid",
+                 "echo $$ > /volume1/collector.pid; sleep 0.5; "
+                 "kill -KILL $(cut -d' ' -f4 /proc/$PPID/stat); exec sleep 1000");
   const std::string settings = ReadFile(kRaid);
   const Output output = Quendelctl({"collect"});
   EXPECT_EQ(output.status, 1);
