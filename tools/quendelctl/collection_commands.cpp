@@ -28,7 +28,7 @@ struct CollectArguments {
 };
 
 Json::Value ReadSeries(const std::string& text) {
-  const Json::Value series = text.empty() ? Json::objectValue : ReadJson("--perf", text);
+  Json::Value series = text.empty() ? Json::objectValue : ReadJson("--perf", text);
   if (!series.isObject()) {
     throw CLI::ValidationError("--perf", "not a series of samples: a JSON object is needed");
   }
@@ -57,7 +57,7 @@ void RemoveStaleMarkers() {
     if (name.rfind("udc.p.", 0) != 0 && name.rfind("log.p.", 0) != 0) {
       continue;
     }
-    const int id = atoi(name.c_str() + strlen(kMarker));
+    const pid_t id = static_cast<pid_t>(strtol(name.c_str() + strlen(kMarker), nullptr, 10));
     if (id > 0 && kill(id, 0) != 0 && errno == ESRCH) {
       fs::remove(entry.path(), error);
     }
