@@ -121,6 +121,9 @@ TEST_F(RemoteCreateCommandTest, OfTwoAtOnceOneOpensTheSession) {
       " { $quendelctl remote create $user /tmp/staff.pub >/dev/null; echo $? >/tmp/status.$user; } &"
       " done; wait; cat /tmp/status.* | sort");
   EXPECT_EQ(output.out, "0\n1\n1\n1\n");
+  const std::string reason =
+      std::string("quendelctl: a remote session is open already: ") + kConf + " exists\n";
+  EXPECT_EQ(output.err, reason + reason + reason);
 }
 
 TEST_F(RemoteCreateCommandTest, RefusesALinkInThePlaceOfTheFile) {

@@ -76,9 +76,9 @@ TEST(ShmAllocCommandTest, HoldsTheSegmentUntilASignal) {
   // The reader sees the end of the output before the program ends.
   const Output output = Shell(
       "mkfifo /tmp/pipe; { exec $quendelctl shm alloc 0x51 64 --hold >/tmp/pipe; } & "
-      "cat /tmp/pipe; ipcs -m | awk '$1 == \"0x00000051\" { print $6 }'; "
+      "timeout 20 cat /tmp/pipe; echo $?; ipcs -m | awk '$1 == \"0x00000051\" { print $6 }'; "
       "kill $!; wait $!; echo $?; ipcs -m | awk '$1 == \"0x00000051\" { print $6 }'");
-  EXPECT_EQ(output.out, "The segment is there.\n1\n143\n0\n");
+  EXPECT_EQ(output.out, "The segment is there.\n0\n1\n143\n0\n");
 }
 
 TEST(ShmReceiveCommandTest, PrintsTheBytesAsTheyAre) {
