@@ -123,16 +123,15 @@ void OccupyStandardDescriptors() {
 int main(int argc, char** argv) {
   quendelctl::OccupyStandardDescriptors();
   signal(SIGPIPE, SIG_IGN);  // a reader that has gone is an error like a full disk
+  const quendelctl::SafeStderr safeStderr;
+  if (!safeStderr.works()) {
+    return quendelctl::kExitFailed;
+  }
+  openlog("quendelctl", LOG_PERROR, LOG_USER);
   try {
-    const quendelctl::SafeStderr safeStderr;
-    openlog("quendelctl", LOG_PERROR, LOG_USER);
-    try {
-      return quendelctl::Run(argc, argv);
-    } catch (const std::exception& error) {
-      fprintf(stderr, "quendelctl: %s\n", error.what());
-    }
+    return quendelctl::Run(argc, argv);
   } catch (const std::exception& error) {
     fprintf(stderr, "quendelctl: %s\n", error.what());
+    return quendelctl::kExitFailed;
   }
-  return quendelctl::kExitFailed;
 }

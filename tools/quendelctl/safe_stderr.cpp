@@ -12,7 +12,6 @@
 #include <cstring>
 #include <string>
 #include <string_view>
-#include <system_error>
 
 #include "printable.h"
 
@@ -24,8 +23,8 @@ constexpr char kEraseRest[] = "\x1b[K";
 
 int rawStderr = STDERR_FILENO;
 
-[[noreturn]] void Fail(const char* what) {
-  throw std::system_error(errno, std::generic_category(), what);
+void Complain(const char* what) {
+  fprintf(stderr, "quendelctl: %s: %s\n", what, strerror(errno));
 }
 
 void WriteAll(int descriptor, std::string_view text) {
@@ -100,15 +99,18 @@ void Show(int input, int output) {
 SafeStderr::SafeStderr() {
   int ends[2];
   if (pipe2(ends, O_CLOEXEC) != 0) {
-    Fail("cannot make a pipe");
+    Complain("cannot make a pipe");
+    return;
   }
   original_ = fcntl(STDERR_FILENO, F_DUPFD_CLOEXEC, 0);
   if (original_ < 0) {
-    Fail("cannot keep the standard error output");
+    Complain("cannot keep the standard error output");
+    return;
   }
   filter_ = fork();
   if (filter_ < 0) {
-    Fail("cannot start a process");
+    Complain("cannot start a process");
+    return;
   }
   if (filter_ == 0) {
     close(STDOUT_FILENO);  // its reader must see the end while the program may still run
@@ -122,6 +124,9 @@ SafeStderr::SafeStderr() {
 }
 
 SafeStderr::~SafeStderr() {
+  if (!works()) {
+    return;
+  }
   fflush(stderr);
   dup2(original_, STDERR_FILENO);
   rawStderr = STDERR_FILENO;

@@ -11,16 +11,17 @@ namespace quendelctl {
 // as they came, and syslog() prints them without a look at them.
 class SafeStderr {
  public:
-  // Throws std::system_error when the system has no pipe or process left.
+  // Says so when the system has no descriptor or process left, and then changes nothing.
   SafeStderr();
+  bool works() const { return filter_ > 0; }
   // Returns once everything has been shown.
   ~SafeStderr();
   SafeStderr(const SafeStderr&) = delete;
   SafeStderr& operator=(const SafeStderr&) = delete;
 
  private:
-  int original_;
-  pid_t filter_;
+  int original_ = -1;
+  pid_t filter_ = -1;
 };
 
 // Returns the descriptor of the standard error output itself, for what this program draws on a
