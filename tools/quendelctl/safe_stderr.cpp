@@ -102,6 +102,12 @@ SafeStderr::SafeStderr() {
     Complain("cannot make a pipe");
     return;
   }
+  Start(ends[0], ends[1]);
+  close(ends[0]);
+  close(ends[1]);
+}
+
+void SafeStderr::Start(int readEnd, int writeEnd) {
   original_ = fcntl(STDERR_FILENO, F_DUPFD_CLOEXEC, 0);
   if (original_ < 0) {
     Complain("cannot keep the standard error output");
@@ -114,12 +120,10 @@ SafeStderr::SafeStderr() {
   }
   if (filter_ == 0) {
     close(STDOUT_FILENO);  // its reader must see the end while the program may still run
-    close(ends[1]);
-    RunFilter(ends[0], original_);
+    close(writeEnd);
+    RunFilter(readEnd, original_);
   }
-  close(ends[0]);
-  dup2(ends[1], STDERR_FILENO);
-  close(ends[1]);
+  dup2(writeEnd, STDERR_FILENO);
   rawStderr = original_;
 }
 

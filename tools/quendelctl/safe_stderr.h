@@ -20,6 +20,8 @@ class SafeStderr {
   SafeStderr& operator=(const SafeStderr&) = delete;
 
  private:
+  void Start(int readEnd, int writeEnd);
+
   int original_ = -1;
   pid_t filter_ = -1;
 };
