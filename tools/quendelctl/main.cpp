@@ -40,12 +40,12 @@ struct Request {
 
 // A command that has commands of its own leaves the output to them.
 void DeclareJson(CLI::App& command, Request& request) {
-  const std::vector<CLI::App*> own = command.get_subcommands([](CLI::App*) { return true; });
-  for (CLI::App* subcommand : own) {
-    DeclareJson(*subcommand, request);
+  std::vector<CLI::App*> printing = command.get_subcommands([](CLI::App*) { return true; });
+  if (printing.empty()) {
+    printing = {&command};
   }
-  if (own.empty()) {
-    command.add_flag("--json", request.json, "Print one line of JSON instead of text");
+  for (CLI::App* each : printing) {
+    each->add_flag("--json", request.json, "Print one line of JSON instead of text");
   }
 }
 
