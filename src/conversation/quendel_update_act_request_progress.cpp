@@ -15,8 +15,10 @@ constexpr char kLogUnit[] = "quendel_update_act_request_progress";
 
 using namespace quendel;
 
-int QUENDELUpdateActRequestProgress(int requestId, QuendelActionProgress_t progress,
-                                    Json::Value details) try {
+int QUENDELUpdateActRequestProgress(
+    int requestId, QuendelActionProgress_t progress,
+    // NOLINTNEXTLINE(performance-unnecessary-value-param): as declared.
+    Json::Value details) try {
   AccountRecord account;
   if (!account) {
     QUENDEL_LOG("Failed to malloc for pMyhubAccount");
