@@ -120,7 +120,8 @@ extern "C" {
 QUENDEL_WRAP_BY_HAND(ARVOLocalAccountUserDelete);
 int __real_ARVOLocalAccountUserDelete(const char* const* names, int count, ALIBCMRESULT* result);
 int __wrap_ARVOLocalAccountUserDelete(const char* const* names, int count, ALIBCMRESULT* result) {
-  const quendel::test::WrappedCall call("ARVOLocalAccountUserDelete", names[0], count);
+  const quendel::test::WrappedCall call("ARVOLocalAccountUserDelete",
+                                        names == nullptr ? nullptr : names[0], count);
   return call.fails() ? call.result<int>()
                       : __real_ARVOLocalAccountUserDelete(names, count, result);
 }
