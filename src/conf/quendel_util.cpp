@@ -74,9 +74,6 @@ void QUENDELBytesToHex(std::string& out, const unsigned char* bytes, int len) tr
 }
 
 void QUENDELHexToBytes(const std::string& hex, unsigned char* out, int maxlen) {
-  if (maxlen < 1) {
-    return;
-  }
   size_t position = 0;
   for (int n = 0; n < maxlen && position < hex.size(); ++n, position += 2) {
     char pair[3] = {};

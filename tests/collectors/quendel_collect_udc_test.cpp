@@ -425,6 +425,19 @@ TEST(CollectUDCTest, FailsWhenTheResultFileCannotBeWrittenWhole) {
   EXPECT_EQ(Results()["a"].asString().size(), 20000u);
 }
 
+// So little text is not written before the file is closed.
+TEST(CollectUDCTest, FailsWhenTheResultFileCannotBeClosed) {
+  Install("a", "echo 1");
+  fs::create_directories(kRunFolder);
+  fs::create_directories("/tmp/quendel");
+  ASSERT_EQ(mount("small", kRunFolder, "tmpfs", 0, "size=4k"), 0);
+  WriteFile(std::string(kRunFolder) + "/other", std::string(4096, 'x'));
+  EXPECT_EQ(QUENDELCollectUDC(kRunFolder), -1);
+  EXPECT_THAT(Log(), LoggedInOrder("Failed to open file '" + kResult + "'"));
+  EXPECT_FALSE(Exists(kUpdateFile));
+  ASSERT_EQ(umount(kRunFolder), 0);
+}
+
 TEST(CollectUDCTest, ReplacesAnOldResultFile) {
   Install("a", "echo 1");
   fs::create_directories("/tmp/quendel");
