@@ -370,12 +370,12 @@ class LogHistoryTest : public testing::TestWithParam<int> {};
 class WellRotatedLogHistoryTest : public testing::TestWithParam<int> {};
 
 TEST_P(LogHistoryTest, FollowsTheModel) {
-  PlayHistories(1 + 1000 * GetParam(), 1000, Kind::kAnything);
+  PlayHistories(1 + 500 * GetParam(), 500, Kind::kAnything);
 }
 
 TEST_P(WellRotatedLogHistoryTest, FollowsTheModelAndLosesNoLine) {
   PlayHistories(100001 + 500 * GetParam(), 500, Kind::kWellRotated);
 }
 
-INSTANTIATE_TEST_SUITE_P(Thousand, LogHistoryTest, testing::Range(0, 4));
+INSTANTIATE_TEST_SUITE_P(FiveHundred, LogHistoryTest, testing::Range(0, 8));
 INSTANTIATE_TEST_SUITE_P(FiveHundred, WellRotatedLogHistoryTest, testing::Range(0, 3));
