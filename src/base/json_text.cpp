@@ -5,6 +5,7 @@
 #include <json/writer.h>
 
 #include <cstring>
+#include <new>
 
 namespace quendel {
 
@@ -16,6 +17,8 @@ bool JsonFromText(const std::string& text, Json::Value& value) {
     }
     value.swap(parsed);
     return true;
+  } catch (const std::bad_alloc&) {
+    throw;
   } catch (...) {
     return false;  // nested too deeply
   }

@@ -13,6 +13,7 @@ namespace quendel {
 
 // Parses a text of any kind of JSON value. Comments, and anything behind the value, are accepted.
 // Returns false, with `value` untouched, for a text that is not JSON or nests deeper than 1,000.
+// Throws only when memory runs out.
 bool JsonFromText(const std::string& text, Json::Value& value);
 
 // Returns the value's JSON text: compact, without a line end.

@@ -94,6 +94,15 @@ bool StageHash(const char* conf, const char* hash, OwnedHash& staged) {
   return true;
 }
 
+// What is too much for the memory is no value either.
+bool ParseOutput(const std::string& output, Json::Value& value) {
+  try {
+    return JsonFromText(output, value);
+  } catch (...) {
+    return false;
+  }
+}
+
 // Judges what a collector printed and sets its member of the results, or leaves it out.
 void TakeOutput(const char* conf, const QUENDELUDCConf_t& record, const std::string& output,
                 OwnedHash& staged, Json::Value& results) {
@@ -105,7 +114,7 @@ void TakeOutput(const char* conf, const QUENDELUDCConf_t& record, const std::str
   }
   ALIBCHashRemoveAll(staged.get());
   Json::Value value;
-  if (!JsonFromText(output, value)) {
+  if (!ParseOutput(output, value)) {
     QUENDEL_LOG("Failed to set json value of '%s'", record.path);
     return;
   }

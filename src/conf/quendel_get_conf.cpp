@@ -1,8 +1,7 @@
 // The few settings that the library reads for itself: contact list, server host, service state.
-#include <json/value.h>
+#include "conf/server_host.h"
 
-#include <cstring>
-#include <mutex>
+#include <json/value.h>
 
 #include "base/json_text.h"
 #include "base/log.h"
@@ -29,16 +28,23 @@ Json::Value ContactFromText(const std::string& text) {
   return Json::arrayValue;
 }
 
-// The value of "quendel_server", or an empty text when the device does not name a server.
-std::string ReadConfiguredHost() {
-  char host[32] = {};
-  if (ALIBCFileGetKeyValue(kDefaultsFile, "quendel_server", host, sizeof host, 0) <= 0) {
-    return {};
-  }
-  return {host, strnlen(host, sizeof host)};
+// Returns a copy of the value, or an empty text when the hash does not have the key.
+std::string HashValue(ALIBSZHASH* hash, const char* key) {
+  const char* value = ALIBCSzHashGetValue(hash, key);
+  return value == nullptr ? std::string() : std::string(value);
 }
 
 }  // namespace
+
+const char* ServerHost() {
+  // The byte behind the 32 that the platform may write keeps the text from running on.
+  static char configured[32 + 1] = {};
+  // Deliberate: looked up once in the life of the process, and a failed read is final too.
+  static const bool isConfigured =
+      ALIBCFileGetKeyValue(kDefaultsFile, "quendel_server", configured, 32, 0) > 0;
+  return isConfigured ? configured : QUENDEL_DEFAULT_SERVER_HOST;
+}
+
 }  // namespace quendel
 
 using namespace quendel;
@@ -53,30 +59,14 @@ int QUENDELGetConf(QUENDELConf_t* conf) try {
     QUENDEL_LOG("Failed to get quendel configuration file");
     return -1;
   }
-  conf->contact = ContactFromText(QUENDELGetHashValue(hash.get(), "contact"));
+  conf->contact = ContactFromText(HashValue(hash.get(), "contact"));
   return 0;
 } catch (...) {
   QUENDEL_LOG("Fail to allocate memory for alibc hash");
   return -1;
 }
 
-std::string QUENDELGetServerHost() try {
-  static std::mutex guard;
-  static std::string host = QUENDEL_DEFAULT_SERVER_HOST;
-  static bool lookedUp = false;
-
-  const std::lock_guard<std::mutex> lock(guard);
-  if (!lookedUp) {
-    // Deliberate: set before the read, so that a failed read is final too and the file is consulted
-    // once in the life of the process.
-    lookedUp = true;
-    std::string configured = ReadConfiguredHost();
-    if (!configured.empty()) {
-      host = std::move(configured);
-    }
-  }
-  return host;
-} catch (...) {
+std::string QUENDELGetServerHost() try { return ServerHost(); } catch (...) {
   return {};
 }
 
@@ -85,8 +75,7 @@ int QUENDELIsEnable() {
 }
 
 std::string QUENDELGetHashValue(ALIBSZHASH* hash, const char* key) try {
-  const char* value = ALIBCSzHashGetValue(hash, key);
-  return value == nullptr ? std::string() : std::string(value);
+  return HashValue(hash, key);
 } catch (...) {
   return {};
 }

@@ -6,7 +6,7 @@
 #include <unistd.h>
 
 #include "base/log.h"
-#include "quendel/conf.h"
+#include "conf/server_host.h"
 #include "quendel/transport.h"
 #include "transport/curl_session.h"
 
@@ -18,20 +18,21 @@ constexpr char kLogUnit[] = "util.cpp";
 constexpr int kAttempts = 6;
 constexpr unsigned int kPauseSeconds = 1;
 
-// Looks the host up. Returns its first IPv4 address as dotted text, or an empty text.
-std::string FirstAddress(const std::string& host) {
-  const hostent* found = gethostbyname(host.c_str());
+// Looks the host up. Returns its first IPv4 address as dotted text, in a buffer of the C library,
+// or null.
+const char* FirstAddress(const char* host) {
+  const hostent* found = gethostbyname(host);
   if (found == nullptr || found->h_addrtype != AF_INET || found->h_addr_list[0] == nullptr) {
-    return {};
+    return nullptr;
   }
   return inet_ntoa(*reinterpret_cast<const in_addr*>(found->h_addr_list[0]));
 }
 
-bool ConnectOnce(const std::string& dottedAddress) {
+bool ConnectOnce(const char* dottedAddress) {
   sockaddr_in server = {};
   server.sin_family = AF_INET;
   server.sin_port = htons(kServerPort);
-  server.sin_addr.s_addr = inet_addr(dottedAddress.c_str());
+  server.sin_addr.s_addr = inet_addr(dottedAddress);
 
   const int fd = socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
   if (connect(fd, reinterpret_cast<const sockaddr*>(&server), sizeof server) != 0) {
@@ -47,11 +48,11 @@ bool ConnectOnce(const std::string& dottedAddress) {
 
 using namespace quendel;
 
-int QUENDELIsServerReachable() try {
-  const std::string host = QUENDELGetServerHost();
-  const std::string address = FirstAddress(host);
-  if (address.empty()) {
-    QUENDEL_LOG("Failed to get IP address of target hostname: %s", host.c_str());
+int QUENDELIsServerReachable() {
+  const char* const host = ServerHost();
+  const char* const address = FirstAddress(host);
+  if (address == nullptr) {
+    QUENDEL_LOG("Failed to get IP address of target hostname: %s", host);
     return 0;
   }
   bool previousConnected = false;
@@ -66,7 +67,4 @@ int QUENDELIsServerReachable() try {
     }
     sleep(kPauseSeconds);
   }
-} catch (...) {
-  QUENDEL_LOG("Failed to get IP address of target hostname: %s", "");
-  return 0;
 }

@@ -1,7 +1,7 @@
 // The texts of an exchange: the URL of a request, the bytes of a reply, and what a reply says.
 #include "base/json_text.h"
 #include "base/log.h"
-#include "quendel/conf.h"
+#include "conf/server_host.h"
 #include "quendel/transport.h"
 
 namespace quendel {
@@ -25,7 +25,7 @@ const std::map<int, _tag_WEBAPI_CORE_ERR> QUENDELWebapiErrorMap = {
 };
 
 std::string QUENDELGenerateReq(const std::vector<std::string>& pieces) try {
-  std::string url = "https://" + QUENDELGetServerHost();
+  std::string url = std::string("https://") + ServerHost();
   for (const std::string& piece : pieces) {
     url += '/';
     url += piece;
