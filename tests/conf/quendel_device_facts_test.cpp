@@ -74,13 +74,15 @@ TEST(GetHMXModelTest, FailsWhenTheFileCannotBeRead) {
   EXPECT_THAT(Log(), ElementsAre(Logged("quendel_device_facts", "Failed to get model name")));
 }
 
-TEST(GetHMXModelTest, ReleasesThePlatformsLockInEveryCase) {
+TEST(GetHMXModelTest, ReleasesThePlatformsLockAfterEveryRead) {
+  constexpr char kRead[] = "/etc.defaults/arvoinfo.conf|upnpmodelname|64|0";
+  Record("ALIBCFileGetKeyValue");
   Record("ALIBCFileUnlock");
   char model[64];
-  QUENDELGetHMXModel(model, sizeof model);
-  RemoveFile(kDefaults);
-  QUENDELGetHMXModel(model, sizeof model);
-  EXPECT_THAT(Recorded(), ElementsAre("2048", "2048"));
+  EXPECT_EQ(QUENDELGetHMXModel(model, sizeof model), 0);
+  FailCall("ALIBCFileGetKeyValue", 1, -7);
+  EXPECT_EQ(QUENDELGetHMXModel(model, sizeof model), -1);
+  EXPECT_THAT(Recorded(), ElementsAre(kRead, "2048", kRead, "2048"));
 }
 
 TEST(GetHMXVersionTest, NamesTheBuild) {
@@ -119,6 +121,12 @@ TEST(GetHMXVersionTest, IsCutToTheBuffer) {
   EXPECT_EQ(QUENDELGetHMXVersion(version, 7), 0);
   EXPECT_STREQ(version, "HMX 3.");
   EXPECT_EQ(version[7], 'x');
+}
+
+TEST(GetHMXVersionTest, MakesRoomForTheWholeFile) {
+  Record("ALIBCSzHashAlloc");
+  VersionOf("");
+  EXPECT_THAT(Recorded(), ElementsAre("512"));
 }
 
 TEST(GetHMXVersionTest, FailsWhenMemoryRunsOut) {
@@ -188,6 +196,14 @@ TEST(GetDstDirTest, PassesOnThatThePlatformCannotTell) {
   FailCall("ALIBCFileCheckDir", 1, -1);
   char path[64];
   EXPECT_EQ(QUENDELGetDstDir(path, sizeof path, kMoment), -1);
+  EXPECT_STREQ(path, "/tmp/quendel_20240305_070809_0");
+}
+
+TEST(GetDstDirTest, TakesOnlyOneForATakenName) {
+  UseTimeZone("UTC0");
+  FailCall("ALIBCFileCheckDir", 1, 2);
+  char path[64];
+  EXPECT_EQ(QUENDELGetDstDir(path, sizeof path, kMoment), 2);
   EXPECT_STREQ(path, "/tmp/quendel_20240305_070809_0");
 }
 

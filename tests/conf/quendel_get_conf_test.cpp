@@ -81,6 +81,19 @@ TEST(GetConfTest, LeavesTheRecordAloneWhenMemoryRunsOut) {
               ElementsAre(Logged("quendel_get_conf", "Fail to allocate memory for alibc hash")));
 }
 
+TEST(GetConfTest, TakesOnlyANegativeAnswerForAFailedRead) {
+  EXPECT_EQ(ContactOf(""), kEmptyArray);
+  FailCall("ALIBCFileGetPair", 1, -7);
+  QUENDELConf_t conf;
+  EXPECT_EQ(QUENDELGetConf(&conf), -1);
+}
+
+TEST(GetConfTest, MakesRoomForTheWholeFile) {
+  Record("ALIBCSzHashAlloc");
+  ContactOf("contact=1\n");
+  EXPECT_THAT(Recorded(), ElementsAre("1024"));
+}
+
 TEST(GetConfTest, ReadsTheFileAnewAtEachCall) {
   EXPECT_EQ(ContactOf("contact=1\n"), Json::Value(1));
   EXPECT_EQ(ContactOf("contact=2\n"), Json::Value(2));
@@ -111,6 +124,13 @@ TEST(GetServerHostTest, IsTheDefaultWhenTheKeyIsMissing) {
 TEST(GetServerHostTest, IsTheDefaultWhenTheValueIsEmpty) {
   WriteFile(kDefaults, "quendel_server=\n");
   EXPECT_EQ(QUENDELGetServerHost(), QUENDEL_DEFAULT_SERVER_HOST);
+}
+
+TEST(GetServerHostTest, IsWhateverTextTheReaderFound) {
+  Record("ALIBCFileGetKeyValue");
+  FailCall("ALIBCFileGetKeyValue", 1, 5);
+  EXPECT_EQ(QUENDELGetServerHost(), "");
+  EXPECT_THAT(Recorded(), ElementsAre("/etc.defaults/arvoinfo.conf|quendel_server|32|0"));
 }
 
 TEST(GetServerHostTest, NeverRetriesAFailedRead) {

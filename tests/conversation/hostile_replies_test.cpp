@@ -1,6 +1,8 @@
 // Every function that posts, against every reply that a server which nobody authenticated may send.
 #include <gmock/gmock.h>
 
+#include <functional>
+
 #include "quendel.h"
 #include "support/appliance.h"
 #include "support/log.h"
@@ -10,7 +12,6 @@
 using namespace quendel::test;
 using testing::ElementsAre;
 using testing::IsEmpty;
-using testing::SizeIs;
 using testing::StartsWith;
 
 namespace {

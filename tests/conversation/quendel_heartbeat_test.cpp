@@ -96,6 +96,15 @@ TEST(HeartbeatTest, FailsWithoutASerialNumber) {
   EXPECT_THAT(Requests(), IsEmpty());
 }
 
+TEST(HeartbeatTest, TakesOnlyANegativeAnswerForAMissingSerialNumber) {
+  FailCall("ALIBGetSerialNumber", 1, 1);
+  Json::Value actions;
+  EXPECT_EQ(QUENDELHeartbeat(actions), 0);
+  EXPECT_EQ(Requests().at(0).line, "POST /heartbeat/ HTTP/1.1");
+  FailCall("ALIBGetSerialNumber", 1, -7);
+  ExpectFailure();
+}
+
 TEST(HeartbeatTest, FailsWhenTheServerRefuses) {
   SetIdentity();
   Answer({.body = R"({"success":false,"actions":[]})"});

@@ -67,6 +67,22 @@ TEST(UpdateActRequestProgressTest, LeavesTheSegmentsOfEmptyFieldsEmpty) {
   EXPECT_EQ(RequestLine(), "POST /action_progress/17/0///S1 HTTP/1.1");
 }
 
+TEST(UpdateActRequestProgressTest, TakesOnlyANegativeAnswerForAMissingAccount) {
+  SetIdentity();
+  FailCall("ARVOMYHUBAccountGet", 1, 1);
+  EXPECT_EQ(Report(17, 0), 0);
+  EXPECT_EQ(RequestLine(), "POST /action_progress/17/0///S1 HTTP/1.1");
+  FailCall("ARVOMYHUBAccountGet", 1, -7);
+  EXPECT_EQ(Report(17, 0), -1);
+}
+
+TEST(UpdateActRequestProgressTest, AsksThePlatformForOneWholeRecord) {
+  SetIdentity();
+  Record("calloc");
+  EXPECT_EQ(Report(17, 0), 0);
+  EXPECT_THAT(Recorded(), ElementsAre("1|20256"));
+}
+
 TEST(UpdateActRequestProgressTest, FailsWithoutMemoryBeforeAnythingElse) {
   FailCall("calloc", 1, 0);
   EXPECT_EQ(Report(17, 0), -1);

@@ -1,6 +1,9 @@
 // The connect test: pairs of successes within six attempts.
 #include <dirent.h>
 #include <gmock/gmock.h>
+#include <sys/socket.h>
+
+#include <cerrno>
 
 #include "quendel.h"
 #include "support/accept_pattern.h"
@@ -88,8 +91,22 @@ TEST(IsServerReachableTest, IsFalseWhenEveryAttemptFails) {
 TEST(IsServerReachableTest, LeavesTheSocketsOfFailedAttemptsOpen) {
   AcceptPattern server("rrrrrr");
   const int before = OpenDescriptors();
+  Record("socket");
   QUENDELIsServerReachable();
   EXPECT_EQ(OpenDescriptors(), before + 6);
+  // None of them gets into a program that the process starts later.
+  const std::string closedOnExec =
+      std::to_string(AF_INET) + "|" + std::to_string(SOCK_STREAM | SOCK_CLOEXEC) + "|0";
+  EXPECT_THAT(Recorded(), Each(closedOnExec));
+}
+
+TEST(IsServerReachableTest, CountsASocketThatCannotBeHadAsAFailedAttempt) {
+  FailCall("socket", 0, -1, EMFILE);
+  EXPECT_EQ(QUENDELIsServerReachable(), 0);
+  EXPECT_THAT(Log(), AllOf(SizeIs(6), Each(Logged(kUnit,
+                                                  "connect to a socket failed, errno: "
+                                                  "Bad file descriptor"))));
+  EXPECT_EQ(SleptSeconds(), 5);
 }
 
 TEST(IsServerReachableTest, ClosesTheSocketsOfConnections) {

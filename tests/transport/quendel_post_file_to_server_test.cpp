@@ -13,6 +13,7 @@
 #include "support/json.h"
 #include "support/log.h"
 #include "support/server.h"
+#include "transport/curl_line.h"
 #include "transport/multipart.h"
 
 using namespace quendel::test;
@@ -49,7 +50,7 @@ int Describe(Json::Value& info, const QUENDELSendDataParam_t& item) {
 
 int DescribeAllButB(Json::Value& info, const QUENDELSendDataParam_t& item) {
   info["path"] = item.path;
-  return item.path == "/tmp/b.txt" ? 1 : 0;
+  return item.path == "/tmp/b.txt" ? -1 : 0;
 }
 
 int ThrowForB(Json::Value& info, const QUENDELSendDataParam_t& item) {
@@ -81,10 +82,6 @@ std::vector<std::string> DescribedPaths() {
     paths.push_back(description["path"].asString());
   }
   return paths;
-}
-
-std::string CurlLine(CURLcode code) {
-  return "CURL Error(" + std::to_string(code) + "): " + curl_easy_strerror(code);
 }
 
 long PeakMemoryKiB() {

@@ -1,0 +1,17 @@
+// What both posts log of a transfer that failed.
+#ifndef TRANSPORT_CURL_LINE_H_
+#define TRANSPORT_CURL_LINE_H_
+
+#include <curl/curl.h>
+
+#include <string>
+
+namespace quendel::test {
+
+inline std::string CurlLine(CURLcode code) {
+  return "CURL Error(" + std::to_string(code) + "): " + curl_easy_strerror(code);
+}
+
+}  // namespace quendel::test
+
+#endif  // TRANSPORT_CURL_LINE_H_
