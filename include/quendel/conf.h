@@ -26,7 +26,7 @@ QUENDEL_EXPORT int QUENDELGetConf(QUENDELConf_t* conf);
 // The file is read at the first call only. What that read gave stays for the life of the process;
 // if it gave nothing, that is the host built into the library. Safe to call from several threads.
 //
-// Returns the host name; never fails.
+// Returns the host name, or an empty text when memory ran out.
 QUENDEL_EXPORT std::string QUENDELGetServerHost();
 
 // Tells whether the service daemon, "quendeld", is configured to run on this device.
@@ -36,7 +36,8 @@ QUENDEL_EXPORT int QUENDELIsEnable();
 
 // Looks a key up in a platform hash, which is not changed.
 //
-// Returns a copy of the value, or an empty text when the hash does not have the key.
+// Returns a copy of the value, or an empty text when the hash does not have the key or memory ran
+// out.
 QUENDEL_EXPORT std::string QUENDELGetHashValue(ALIBSZHASH* hash, const char* key);
 
 // Writes the device's model name into buf: key "upnpmodelname" of "/etc.defaults/arvoinfo.conf", of
@@ -68,11 +69,11 @@ QUENDEL_EXPORT int QUENDELGetLocalTime(char* buf, size_t size, time_t when);
 // Finds a work directory name that no directory has yet, "/tmp/quendel_20240305_070809_0": the
 // local time of `when` and the first number, counted from 0, that is free. A file of that name does
 // not make it taken. The directory is not created, so two processes can find the same name; not
-// safe to call from several threads at once. The text is cut to size - 1 bytes and always
-// NUL-terminated; 64 bytes are enough.
+// safe to call from several threads at once. `size` is at least 1; the text is cut to size - 1
+// bytes and always NUL-terminated; 64 bytes are enough.
 //
 // Returns the platform's answer for the name found: 0, or negative when the platform could not
-// tell.
+// tell; or 1 when the name was cut and a directory has the name that is left.
 QUENDEL_EXPORT int QUENDELGetDstDir(char* buf, size_t size, time_t when);
 
 // Small helpers for files and texts. None of them logs.
@@ -84,8 +85,7 @@ QUENDEL_EXPORT int QUENDELFileCopy(const char* src, const char* dst);
 
 // Makes a directory and those above it that are missing, with the system's mkdir. `mode` is the
 // mode of the last of them; of its octal text the first seven digits count. Nothing is done for
-// exactly "." and
-// "/".
+// exactly "." and exactly "/".
 //
 // Whether the directory was made is not told: a tool that ran and failed counts as success.
 //
@@ -93,8 +93,7 @@ QUENDEL_EXPORT int QUENDELFileCopy(const char* src, const char* dst);
 QUENDEL_EXPORT int QUENDELRecursiveMkdir(const char* path, unsigned int mode);
 
 // Removes a file, or a directory with all it holds, with the system's rm. Nothing is done for
-// exactly
-// "." and "/".
+// exactly "." and exactly "/".
 //
 // Whether anything was removed is not told: a tool that ran and failed counts as success.
 //

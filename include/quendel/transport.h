@@ -71,6 +71,7 @@ QUENDEL_EXPORT int QUENDELGetWebapiError(int code);
 // sent. Takes up to five seconds and the system's own time for each connection.
 //
 // Each failed attempt leaves its socket open, so a call can cost the process up to six descriptors.
+// Not safe to call from several threads at once.
 //
 // Returns 1 when the server is reachable, else 0.
 QUENDEL_EXPORT int QUENDELIsServerReachable();

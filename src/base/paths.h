@@ -1,4 +1,5 @@
-// The one home of every fixed path on the appliance that the library reads or writes.
+// The one home of every fixed path on the appliance that the library reads or writes. The name of a
+// run's own directory is made where the run gets it.
 #ifndef BASE_PATHS_H_
 #define BASE_PATHS_H_
 
@@ -12,7 +13,7 @@ inline constexpr char kVersionFile[] = "/etc.defaults/VERSION";
 // One file per collector, and its state.
 inline constexpr char kCollectorConfDir[] = "/usr/arvo/etc/quendel";
 
-// The work directory of every run, and the collectors' staged state in it.
+// Where requested files are prepared, and where the collectors' state is staged.
 inline constexpr char kWorkRoot[] = "/tmp/quendel";
 inline constexpr char kLogUpdateFile[] = "/tmp/quendel/quendel.log.update.conf";
 inline constexpr char kUdcUpdateFile[] = "/tmp/quendel/quendel.udc.update.conf";

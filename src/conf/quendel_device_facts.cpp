@@ -16,7 +16,7 @@ constexpr char kLogUnit[] = "quendel_device_facts";
 
 constexpr int kVersionHashSize = 512;
 
-// The platform keeps the lock of this number for readers of the model name.
+// Which lock this is, is the platform's own affair. It is released whenever the name was asked for.
 constexpr int kModelFileLock = 0x800;
 
 const char* TextOrEmpty(const char* text) {
@@ -37,7 +37,7 @@ int QUENDELGetHMXModel(char* buf, size_t size) {
   } else {
     snprintf(buf, size, "%s", model);
   }
-  ALIBCFileUnlock(kModelFileLock);
+  ALIBCFileUnlock(kModelFileLock);  // Deliberate: also after a failed read.
   return result;
 }
 

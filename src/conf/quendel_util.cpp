@@ -42,6 +42,7 @@ int QUENDELRecursiveMkdir(const char* path, unsigned int mode) {
   }
   char modeText[8];
   snprintf(modeText, sizeof modeText, "%o", mode);
+  // Deliberate: the path stands before "-m".
   // Deliberate: what the tool itself reports is not looked at; callers make directories as best
   // they can and find out when they use them.
   return ALIBCExec("/bin/mkdir", "-p", path, "-m", modeText) == -1 ? -1 : 0;

@@ -42,6 +42,7 @@ int QUENDELHeartbeat(Json::Value& actions) try {
   const std::string url = QUENDELGenerateReq({"heartbeat", serialNumber});
   Json::Value reply;
   if (QUENDELPostDataToServer(url.c_str(), Json::Value(), reply) < 0) {
+    // Deliberate: the text of the other conversations, although this is the heartbeat.
     QUENDEL_LOG("Failed to post quendel config");
     return -1;
   }

@@ -27,6 +27,8 @@ using namespace quendel;
 int QUENDELPostEventToServer(QuendelEvent_t event, Json::Value& reply,
                              const Json::Value& hmxInfo) try {
   const std::string name = EventName(event);
+  // Deliberate: the record comes before the check of the event, and every event needs an account,
+  // even one that says that nobody is signed in any more.
   AccountRecord account;
   if (!account) {
     QUENDEL_LOG("Failed to malloc for pMyhubAccount");

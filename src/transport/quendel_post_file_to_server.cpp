@@ -91,6 +91,7 @@ int QUENDELPostFileToServer(const char* url, const char* name,
   }
   const std::string list = JsonToText(descriptions);
   if (!form.AddText(name, list)) {
+    // Deliberate: no quotes round the list, unlike round the path of a file.
     QUENDEL_LOG("Failed to add curl form: %s", list.c_str());
     return -1;
   }
