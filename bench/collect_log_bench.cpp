@@ -4,11 +4,8 @@
 // Runs on an appliance of its own; script/bench starts it. With one argument, a folder, it collects
 // into that and prints its peak memory in KiB: the benchmarks of memory start it so.
 #include <benchmark/benchmark.h>
-#include <fcntl.h>
-#include <spawn.h>
 #include <sys/resource.h>
 #include <sys/stat.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -23,110 +20,52 @@
 #include <vector>
 
 #include "quendel.h"
+#include "scene.h"
+
+using namespace bench;
 
 namespace {
 
 namespace fs = std::filesystem;
 
-constexpr char kConfFolder[] = "/usr/arvo/etc/quendel";
+// What InstallLogs() writes into each log.
+constexpr char kTwoLines[] = "line one\nline two\n";
+
 constexpr char kUpdateFile[] = "/tmp/quendel/quendel.log.update.conf";
 constexpr char kRunFolder[] = "/tmp/run";
 constexpr char kProcessor[] = "processor_ms";
 constexpr char kPeak[] = "peak_MiB";
-constexpr int64_t kGibibyte = int64_t{1} << 30;
-
-constexpr char kFreshState[] =
-    "last_hash=\"\"\ntar_log_inode=\"\"\nlast_byte=\"\"\ntotal_byte=\"\"\ninode=\"\"\n";
-
-// Ends the benchmark: figures of half a scenario would be worse than none.
-[[noreturn]] void Fail(const std::string& what) {
-  perror(what.c_str());
-  exit(1);
-}
-
-void Require(bool holds, const std::string& what) {
-  if (!holds) {
-    Fail(what);
-  }
-}
-
-void WriteText(const std::string& path, const std::string& text) {
-  std::ofstream out(path, std::ios::binary);
-  out << text << std::flush;
-  Require(static_cast<bool>(out), path);
-}
-
-// Appends lines as a log has them, about 90 bytes each.
-void AppendLines(const std::string& path, int64_t bytes) {
-  std::string block;
-  for (int i = 0; block.size() < (1 << 20); ++i) {
-    block += "2024-03-05T07:08:09.123456+00:00 appliance service[" +
-             std::to_string(1000 + i % 9000) + "]: request " + std::to_string(i * 7919 % 1000003) +
-             " done\n";
-  }
-  std::ofstream out(path, std::ios::binary | std::ios::app);
-  for (int64_t written = 0; written < bytes; written += static_cast<int64_t>(block.size())) {
-    out << block;
-  }
-  out << std::flush;
-  Require(static_cast<bool>(out), path);
-}
 
 void ResetFolders() {
-  for (const char* folder : {kConfFolder, kRunFolder, "/tmp/quendel"}) {
-    fs::remove_all(folder);
-    fs::create_directories(folder);
+  for (const char* folder : {"/usr/arvo/etc/quendel", kRunFolder, "/tmp/quendel"}) {
+    MakeEmptyFolder(folder);
   }
-}
-
-void EmptyRunFolder() {
-  fs::remove_all(kRunFolder);
-  fs::create_directory(kRunFolder);
-}
-
-void InstallLog(const std::string& name, const std::string& path) {
-  WriteText(std::string(kConfFolder) + "/quendel.log." + name,
-            "name=" + name + "\npath=" + path + "\n" + kFreshState);
 }
 
 void CollectOnce() {
   Require(QUENDELCollectLog(kRunFolder) == 0, "collect");
 }
 
-void Commit() {
-  Require(QUENDELUpdateCollectConf(kUpdateFile) == 0, "commit");
+// A collection that gives a log up is none the less a good one.
+void RequireCollected(const std::string& folder, int64_t bytes) {
+  Require(fs::file_size(folder + "/m") >= static_cast<uintmax_t>(bytes), "the lines");
 }
 
-// Runs a program to its end, its output going to a file.
-void RunProgram(std::vector<std::string> words, const std::string& output) {
-  std::vector<char*> arguments;
-  for (std::string& word : words) {
-    arguments.push_back(word.data());
-  }
-  arguments.push_back(nullptr);
-  posix_spawn_file_actions_t actions;
-  posix_spawn_file_actions_init(&actions);
-  posix_spawn_file_actions_addopen(&actions, 1, output.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0600);
-  pid_t child = 0;
-  Require(posix_spawn(&child, arguments[0], &actions, nullptr, arguments.data(), environ) == 0,
-          words[0]);
-  posix_spawn_file_actions_destroy(&actions);
-  int status = -1;
-  Require(waitpid(child, &status, 0) == child && status == 0, words[0]);
+void Commit() {
+  Require(QUENDELUpdateCollectConf(kUpdateFile) == 0, "commit");
 }
 
 // A log of one collected line and new ones behind it, on a file system of the benchmark's choice.
 std::string MakeGrownLog(const std::string& folder, int64_t bytes) {
   ResetFolders();
-  fs::remove_all(folder);
-  fs::create_directories(folder);
+  MakeEmptyFolder(folder);
   const std::string log = folder + "/messages";
   WriteText(log, "first line\n");
   InstallLog("m", log);
   CollectOnce();
   Commit();
   AppendLines(log, bytes);
-  EmptyRunFolder();
+  MakeEmptyFolder(kRunFolder);
   return log;
 }
 
@@ -158,7 +97,7 @@ void TimeCopy(benchmark::State& state, const Copy& copy) {
     copy();
     processor += ProcessorTime() - before;
     state.PauseTiming();
-    EmptyRunFolder();
+    MakeEmptyFolder(kRunFolder);
     state.ResumeTiming();
   }
   state.SetBytesProcessed(state.iterations() * kGibibyte);
@@ -169,14 +108,17 @@ void DiffCopy(benchmark::State& state) {
   MakeGrownLog(FolderFor(state), kGibibyte);
   TimeCopy(state, [] {
     CollectOnce();
-    Require(fs::file_size(std::string(kRunFolder) + "/m") >= kGibibyte, "the new lines");
+    RequireCollected(kRunFolder, kGibibyte);
   });
 }
 
 void WholeCopy(benchmark::State& state) {
   const std::string log = MakeGrownLog(FolderFor(state), kGibibyte);
   InstallLog("m", log);
-  TimeCopy(state, [] { CollectOnce(); });
+  TimeCopy(state, [] {
+    CollectOnce();
+    RequireCollected(kRunFolder, kGibibyte);
+  });
 }
 
 void Cp(benchmark::State& state) {
@@ -207,22 +149,23 @@ int64_t PeakKibibytes() {
       return kibibytes;
     }
   }
-  Fail("VmHWM");
+  Require(false, "VmHWM");
+  return 0;
 }
 
 // The peak memory of a fresh process that collects a log of so many MiB, `whole` or its new lines.
 void Memory(benchmark::State& state, bool whole) {
   const char* folder = getenv("QUENDEL_BENCH_DATA");
-  const std::string log = MakeGrownLog(folder, state.range(0) << 20);
+  const std::string log = MakeGrownLog(folder, state.range(0) * kMebibyte);
   if (whole) {
     InstallLog("m", log);
   }
   const std::string run = std::string(folder) + "/run";
   int64_t kibibytes = 0;
   for (auto unused : state) {
-    fs::remove_all(run);
-    fs::create_directories(run);
+    MakeEmptyFolder(run);
     RunProgram({"/proc/self/exe", run}, "/tmp/peak");
+    RequireCollected(run, state.range(0) * kMebibyte);
     std::ifstream("/tmp/peak") >> kibibytes;
   }
   Require(kibibytes > 0, "the peak memory");
@@ -240,31 +183,49 @@ void MemoryOfWholeCopy(benchmark::State& state) {
 
 void InstallLogs(int64_t count) {
   ResetFolders();
-  fs::remove_all("/volume1/logs");
-  fs::create_directories("/volume1/logs");
+  MakeEmptyFolder("/volume1/logs");
   for (int64_t i = 0; i < count; ++i) {
     const std::string name = std::to_string(i);
     const std::string log = "/volume1/logs/" + name;
-    WriteText(log, "line one\nline two\n");
+    WriteText(log, kTwoLines);
     InstallLog(name, log);
   }
+}
+
+void RequireCommitted(const std::string& name) {
+  std::ifstream conf(ConfOf(name));
+  for (std::string line; std::getline(conf, line);) {
+    if (line == "total_byte=" + std::to_string(strlen(kTwoLines))) {
+      return;
+    }
+  }
+  Require(false, "the state of " + name);
 }
 
 void CollectNothingNew(benchmark::State& state) {
   InstallLogs(state.range(0));
   CollectOnce();
   Commit();
+  RequireCommitted("0");
   for (auto unused : state) {
     CollectOnce();
   }
   Require(!fs::exists(kUpdateFile), "nothing new");
 }
 
+// Each time the state is new to every collector: one that is told what it knows writes nothing.
 void CommitAll(benchmark::State& state) {
   InstallLogs(state.range(0));
   CollectOnce();
   for (auto unused : state) {
     Commit();
+    state.PauseTiming();
+    RequireCommitted("0");
+    for (int64_t i = 0; i < state.range(0); ++i) {
+      InstallLog(std::to_string(i), "/volume1/logs/" + std::to_string(i));
+    }
+    sync();  // the commit waits for the disk with its own files only
+    state.ResumeTiming();
   }
 }
 
@@ -320,6 +281,12 @@ class LeastTimes : public benchmark::BenchmarkReporter {
         PrintRatio(std::string(name) + "/" + place, std::string("Cp/") + place);
       }
     }
+    printf("\n%-34s %12s\n", "Peak memory against 1 MiB of log", "peak");
+    for (const char* name : {"MemoryOfDiffCopy", "MemoryOfWholeCopy"}) {
+      for (const char* size : {"1024", "4096"}) {
+        PrintPeakRatio(name, size);
+      }
+    }
     printf("\n%-34s %12s %12s\n", "Growth per ten times the input", "time", "processor");
     for (const char* name : {"CollectNothingNew", "CommitAll"}) {
       for (int count = 10; count < 10000; count *= 10) {
@@ -361,6 +328,14 @@ class LeastTimes : public benchmark::BenchmarkReporter {
     }
   }
 
+  void PrintPeakRatio(const std::string& stem, const std::string& size) const {
+    const std::string name = stem + "/MiB:" + size;
+    const std::string base = stem + "/MiB:1";
+    if (least_.count(name) != 0 && least_.count(base) != 0) {
+      printf("%-34s %12.2f\n", name.c_str(), least_.at(name).peak / least_.at(base).peak);
+    }
+  }
+
   std::map<std::string, Least> least_;
 };
 
@@ -373,6 +348,9 @@ int main(int argc, char** argv) {
     return collected ? 0 : 1;
   }
   benchmark::Initialize(&argc, argv);
+  if (benchmark::ReportUnrecognizedArguments(argc, argv)) {
+    return 2;
+  }
   LeastTimes reporter;
   benchmark::RunSpecifiedBenchmarks(&reporter);
   return 0;
