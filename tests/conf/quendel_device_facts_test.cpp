@@ -103,6 +103,7 @@ TEST(GetHMXVersionTest, NamesNoUpdateWhenTheKeyIsMissing) {
 TEST(GetHMXVersionTest, TakesOnlyAPlainZeroForNoUpdate) {
   const std::string build = "majorversion=3\nminorversion=2\nbuildnumber=2044\n";
   EXPECT_EQ(VersionOf(build + "smallfixnumber=00\n"), "HMX 3.2-2044 Update 00");
+  EXPECT_EQ(VersionOf(build + "smallfixnumber=\n"), "HMX 3.2-2044 Update ");
   EXPECT_EQ(VersionOf(build + "smallfixnumber=\"0 \"\n"), "HMX 3.2-2044 Update 0 ");
 }
 
@@ -208,7 +209,12 @@ TEST(GetDstDirTest, TakesOnlyOneForATakenName) {
 }
 
 TEST(GetDstDirTest, EndsWhenTheBufferIsTooSmallForAnyFreeName) {
-  char path[5];
-  EXPECT_EQ(QUENDELGetDstDir(path, sizeof path, kMoment), 1);
+  UseTimeZone("UTC0");
+  char path[64];
+  EXPECT_EQ(QUENDELGetDstDir(path, 5, kMoment), 1);
   EXPECT_STREQ(path, "/tmp");
+  const std::string cut = "/tmp/quendel_20240305_070809_";
+  mkdir(cut.c_str(), 0700);
+  EXPECT_EQ(QUENDELGetDstDir(path, cut.size() + 1, kMoment), 1);
+  EXPECT_EQ(path, cut);
 }

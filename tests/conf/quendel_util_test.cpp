@@ -154,6 +154,7 @@ TEST(RecursiveRmdirTest, FailsOnlyWhenTheToolCannotBeRun) {
 
 TEST(MD5StringTest, WritesLowercaseDigitsAndANul) {
   EXPECT_EQ(Md5(""), "d41d8cd98f00b204e9800998ecf8427e");
+  EXPECT_EQ(Md5("a"), "0cc175b9c0f1b6a831c399e269772661");
   EXPECT_EQ(Md5("The quick brown fox jumps over the lazy dog"), "9e107d9d372bb6826bd81d3542a419d6");
 }
 
