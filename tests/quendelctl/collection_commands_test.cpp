@@ -517,6 +517,20 @@ TEST(PerfCommandTest, ShowsASeriesAtItsPace) {
               4, 1);
 }
 
+TEST(PerfCommandTest, ShowsSamplesThatFailedAndFails) {
+  for (const char* form : {"perf", "perf --json", "perf --series 1"}) {
+    const Output output =
+        Shell("ASAN_OPTIONS=$ASAN_OPTIONS:verify_asan_link_order=0 LD_PRELOAD=" SILENT_PERFORMANCE
+              " $quendelctl " +
+              std::string(form));
+    EXPECT_EQ(output.status, 1);
+    const Json::Value result = FromJson(output.out);
+    const Json::Value& sample = result.isMember("perf_0") ? result["perf_0"] : result;
+    EXPECT_EQ(sample["success"], false);
+    EXPECT_TRUE(sample["perf_data"].isNull());
+  }
+}
+
 TEST(PerfCommandTest, RejectsWhatIsNoCount) {
   for (const char* count : {"0", "-1"}) {
     ExpectUsageError({"perf", "--series", count}, std::string("--series: ") + count);

@@ -11,9 +11,51 @@ using testing::IsEmpty;
 
 namespace {
 
-const std::vector<std::string> kCommands = {
-    "heartbeat", "event",  "progress",        "collect", "tar",    "send",
-    "perf",      "server", "test-connection", "facts",   "version"};
+const std::vector<std::string> kCommands = {"heartbeat",
+                                            "event",
+                                            "progress",
+                                            "collect",
+                                            "tar",
+                                            "send",
+                                            "perf",
+                                            "conf",
+                                            "upload",
+                                            "remote",
+                                            "shm",
+                                            "server",
+                                            "test-connection",
+                                            "facts",
+                                            "version"};
+
+// Those of them that do something, and the commands of the others.
+const std::vector<std::vector<std::string>> kDoers = {{"heartbeat"},
+                                                      {"event"},
+                                                      {"progress"},
+                                                      {"collect"},
+                                                      {"tar"},
+                                                      {"send"},
+                                                      {"perf"},
+                                                      {"conf", "list"},
+                                                      {"conf", "reset"},
+                                                      {"upload"},
+                                                      {"remote", "create"},
+                                                      {"remote", "close"},
+                                                      {"remote", "key"},
+                                                      {"shm", "alloc"},
+                                                      {"shm", "send"},
+                                                      {"shm", "receive"},
+                                                      {"server"},
+                                                      {"test-connection"},
+                                                      {"facts"},
+                                                      {"version"}};
+
+std::string Joined(const std::vector<std::string>& words) {
+  std::string text;
+  for (const std::string& word : words) {
+    text += (text.empty() ? "" : " ") + word;
+  }
+  return text;
+}
 
 void ExpectUsageError(const std::vector<std::string>& arguments, const std::string& complaint) {
   const Output output = Quendelctl(arguments);
@@ -34,9 +76,12 @@ TEST(CommandLineTest, HelpNamesEveryCommand) {
 }
 
 TEST(CommandLineTest, EachCommandExplainsItself) {
-  for (const std::string& command : kCommands) {
+  for (const std::vector<std::string>& words : kDoers) {
     for (const char* option : {"--help", "-h"}) {
-      const Output output = Quendelctl({command, option});
+      const std::string command = Joined(words);
+      std::vector<std::string> arguments = words;
+      arguments.emplace_back(option);
+      const Output output = Quendelctl(arguments);
       EXPECT_EQ(output.status, 0);
       EXPECT_THAT(output.err, IsEmpty());
       EXPECT_THAT(output.out, HasSubstr("Usage: quendelctl " + command + " [OPTIONS]"));
@@ -44,6 +89,15 @@ TEST(CommandLineTest, EachCommandExplainsItself) {
       EXPECT_THAT(output.out, HasSubstr("\n  quendelctl " + command));  // an example
     }
   }
+  EXPECT_THAT(Requests(), IsEmpty());
+}
+
+TEST(CommandLineTest, TakesNoEmptyValueForOneThatWasNotGiven) {
+  ExpectUsageError({"event", "enable", "--info", ""}, "--info: must not be empty");
+  ExpectUsageError({"progress", "1", "done", "--details", ""}, "--details: must not be empty");
+  ExpectUsageError({"collect", "--perf", ""}, "--perf: must not be empty");
+  ExpectUsageError({"perf", "--series", ""}, "--series: must not be empty");
+  ExpectUsageError({"send", "/tmp/file", "--time", ""}, "--time: must not be empty");
   EXPECT_THAT(Requests(), IsEmpty());
 }
 

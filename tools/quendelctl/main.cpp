@@ -38,22 +38,32 @@ struct Request {
   bool json = false;
 };
 
-// A command that has commands of its own leaves the output to them.
-void DeclareJson(CLI::App& command, Request& request) {
-  std::vector<CLI::App*> printing = command.get_subcommands([](CLI::App*) { return true; });
-  if (printing.empty()) {
-    printing = {&command};
+// An empty value comes from a variable that was not set. It must not pass for one that was not
+// given. What stands without an option's name has to be there, and says itself what it must be.
+void RefuseEmptyValues(CLI::App& command) {
+  for (CLI::Option* option : command.get_options()) {
+    if (!option->get_positional()) {
+      option->check([](const std::string& value) {
+        return value.empty() ? std::string("must not be empty") : std::string();
+      });
+    }
   }
-  for (CLI::App* each : printing) {
-    each->add_flag("--json", request.json, "Print one line of JSON instead of text");
-  }
+}
+
+// Returns the commands that do something: one that has commands of its own leaves that to them.
+std::vector<CLI::App*> Doers(CLI::App& command) {
+  std::vector<CLI::App*> doers = command.get_subcommands([](CLI::App*) { return true; });
+  return doers.empty() ? std::vector<CLI::App*>{&command} : doers;
 }
 
 void DeclareCommand(CLI::App& app, const Command& command, Request& request) {
   CLI::App* subcommand = app.add_subcommand(command.name, command.summary);
   subcommand->group("Commands")->footer(command.examples);
   Action action = command.declare(*subcommand);
-  DeclareJson(*subcommand, request);
+  for (CLI::App* doer : Doers(*subcommand)) {
+    doer->add_flag("--json", request.json, "Print one line of JSON instead of text");
+    RefuseEmptyValues(*doer);
+  }
   subcommand->callback([action, &request] { request.action = action; });
 }
 

@@ -1,0 +1,6 @@
+// Preloaded into quendelctl: a device whose performance figures are not to be had.
+#include "quendel/collect.h"
+
+int QUENDELCollectPerf(Json::Value& /*reply*/) {
+  return -1;
+}
