@@ -22,7 +22,7 @@ constexpr int kConfHashSize = 1024;
 // A text that is missing, empty or not JSON stands for "no contacts".
 Json::Value ContactFromText(const std::string& text) {
   Json::Value contact;
-  if (!text.empty() && JsonFromText(text, contact)) {
+  if (JsonFromText(text, contact)) {
     return contact;
   }
   return Json::arrayValue;

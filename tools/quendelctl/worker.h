@@ -21,9 +21,9 @@ struct WorkerEnd {
 // neither touches this program.
 //
 // Calls `look` with the worker's process id about fifty times a second while it works, and once
-// more before it is ended. SIGHUP,
-// SIGINT, SIGQUIT and SIGTERM end the worker with all that is in its group, and then the function
-// returns. The group is ended as well when the worker died without a result.
+// more before it is ended. SIGHUP, SIGINT, SIGQUIT and SIGTERM end the worker with all that is in
+// its group, and then the function returns. The group is ended as well when the worker died without
+// a result.
 //
 // Throws std::system_error when the system has no pipe or process left. Call it before any thread
 // was started.
