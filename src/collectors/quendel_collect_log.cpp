@@ -298,14 +298,17 @@ DiffResult DiffArchiveCopy(const LogTask& task, int number, const char* copy, co
 // Collects the oldest new archive: its new lines, or all of it where they cannot be told.
 bool CollectOldestArchive(const LogTask& task, int number) {
   Path copy = {};
-  BuildCopyPath(copy, task, number);
+  const bool fits = BuildCopyPath(copy, task, number);
   Path plain = {};
   snprintf(plain, sizeof plain, "%s/%s.%d", task.dst_dir, task.record->name, number);
 
   // Deliberate: an archive that could not be prepared is passed over, not sent whole.
   const DiffResult result = DiffArchiveCopy(task, number, copy, plain);
-  RemoveIfExists(copy);
-  RemoveIfExists(plain);
+  // Names that were cut can be those of files that are to stay, and no copy has been made.
+  if (fits) {
+    RemoveIfExists(copy);
+    RemoveIfExists(plain);
+  }
   return result == DiffResult::kDone || CopyArchive(task, number);
 }
 

@@ -986,3 +986,18 @@ TEST(CollectLogTest, SeesNoArchivesOfALogWhoseNameIsTooLong) {
     RemoveFile(folder);
   }
 }
+
+// The copy's name would be cut to that of the collected log itself.
+TEST(CollectLogTest, DropsAnOldestArchiveWhoseCopyHasNoNameThatFits) {
+  const std::string folder = "/tmp/" + std::string(248, 'd');
+  const std::string output = folder + "/m";
+  ASSERT_EQ(output.size(), 255u);
+  Install();
+  WriteFile(ArchiveOf(kLog, 1), Xz("one\n"));
+  WriteFile(output, "before\n");
+  EXPECT_EQ(QUENDELCollectLog(folder.c_str()), 0);
+  ASSERT_TRUE(Exists(output));
+  EXPECT_EQ(ReadFile(output), "before\n");
+  EXPECT_THAT(Log(), LoggedInOrder("Failed to copy " + Quoted(ArchiveOf(kLog, 1)) + " to " +
+                                   Quoted(output)));
+}
