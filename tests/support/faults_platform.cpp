@@ -15,6 +15,7 @@
 #include "platform/local_account.h"
 #include "platform/process.h"
 #include "platform/zone.h"
+#include "support/own_work.h"
 #include "support/require.h"
 #include "support/wrap.h"
 
@@ -93,6 +94,7 @@ using CommandLine = std::array<const char*, kMostArguments + 2>;
 
 // Takes the texts that follow the program. The rest stays null.
 CommandLine TakeCommandLine(const char* program, va_list arguments) {
+  const quendel::test::OwnWork ownWork;
   CommandLine line = {program};
   size_t count = 1;
   while (const char* argument = va_arg(arguments, const char*)) {
@@ -104,6 +106,7 @@ CommandLine TakeCommandLine(const char* program, va_list arguments) {
 
 // The 80 bytes of a copy's options, as 32-bit numbers.
 std::string DescribeCopyOptions(const void* options) {
+  const quendel::test::OwnWork ownWork;
   std::string text;
   const auto* words = static_cast<const unsigned*>(options);
   for (int i = 0; options != nullptr && i < 20; ++i) {
