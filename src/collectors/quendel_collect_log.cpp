@@ -323,7 +323,7 @@ bool StageArchives(const LogTask& task, const OwnedList& inodes) {
 }
 
 // Collects the archives that were not collected before, the oldest first.
-bool CollectArchives(const LogTask& task) {
+bool CollectArchives(const LogTask& task) try {
   OwnedList inodes(kListSize);
   OwnedList known(kListSize);
   if (!inodes || !known) {
@@ -353,6 +353,9 @@ bool CollectArchives(const LogTask& task) {
     }
   }
   return !visited || StageArchives(task, inodes);
+} catch (...) {
+  QUENDEL_LOG("Failed to allocate memory for list");
+  return false;
 }
 
 bool CollectWhole(const LogTask& task, const char* output, ino_t inode) {
