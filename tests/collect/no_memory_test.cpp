@@ -10,6 +10,7 @@
 #include "quendel.h"
 #include "support/appliance.h"
 #include "support/faults.h"
+#include "support/json.h"
 #include "support/log.h"
 #include "support/scarce_memory.h"
 #include "support/server.h"
@@ -110,6 +111,7 @@ TEST(NoMemoryTest, LosesNothingInACollectionRun) {
   StopTheClock();
   InstallCollectors();
   const std::string log = "/usr/arvo/etc/quendel/quendel.log.messages";
+  const std::string udc = "/usr/arvo/etc/quendel/quendel.udc.raid";
   const auto before = CollectorConf();
   int uncommitted = 0;
   for (long nth = 1; nth < 400; nth += 1 + nth / 10) {
@@ -127,6 +129,11 @@ TEST(NoMemoryTest, LosesNothingInACollectionRun) {
     if (after.at(log) != before.at(log)) {
       EXPECT_EQ(ArchiveEntries(kArchive).at(std::string(kRunName) + "/log/messages"),
                 "first\nsecond\n")
+          << nth;
+    }
+    if (after.at(udc) != before.at(udc)) {
+      EXPECT_EQ(JsonOf(ArchiveEntries(kArchive).at(std::string(kRunName) + "/udc/udc.result")),
+                JsonOf(R"({"raid":{"disks":4}})"))
           << nth;
     }
     uncommitted += after != before ? 0 : 1;
