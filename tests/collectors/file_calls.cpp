@@ -6,6 +6,8 @@
 
 #include <cerrno>
 #include <cstdio>
+#include <filesystem>
+#include <system_error>
 #include <utility>
 
 namespace quendel::test {
@@ -20,6 +22,11 @@ std::function<bool(size_t&)> FailsWith(int error) {
     errno = error;
     return false;
   };
+}
+
+std::string PathOfDescriptor(int file) {
+  std::error_code error;
+  return std::filesystem::read_symlink("/proc/self/fd/" + std::to_string(file), error);
 }
 
 std::function<bool(size_t&)> Once(std::function<void()> action) {
@@ -67,6 +74,17 @@ ssize_t __wrap_pread(int file, void* buffer, size_t count, off_t offset) {
 ssize_t __real_write(int file, const void* buffer, size_t count);
 ssize_t __wrap_write(int file, const void* buffer, size_t count) {
   return Passes(OnFileCalls().write, count) ? __real_write(file, buffer, count) : -1;
+}
+
+int __real_close(int file);
+int __wrap_close(int file) {
+  const bool isLost = OnFileCalls().close && !OnFileCalls().close(file);
+  const int result = __real_close(file);
+  if (isLost) {
+    errno = EIO;
+    return -1;
+  }
+  return result;
 }
 
 int __real_remove(const char* path);

@@ -9,6 +9,7 @@
 #include <sys/types.h>
 
 #include <functional>
+#include <string>
 
 namespace quendel::test {
 
@@ -19,6 +20,9 @@ struct FileCalls {
   std::function<bool(size_t& count)> sendfile;
   std::function<bool(size_t& count)> pread;
   std::function<bool(size_t& count)> write;
+  // Returns false for a file whose last bytes are to be lost when it is closed, with EIO. It is
+  // closed all the same.
+  std::function<bool(int file)> close;
   // Returns false for a path whose removal is to fail with EPERM.
   std::function<bool(const char* path)> remove;
   // Changes what stat() has told of a path.
@@ -29,6 +33,9 @@ FileCalls& OnFileCalls();
 
 // A hook for a call that always fails with this errno.
 std::function<bool(size_t&)> FailsWith(int error);
+
+// The path of an open file.
+std::string PathOfDescriptor(int file);
 
 // A hook that does something at the first call and lets every call pass.
 std::function<bool(size_t&)> Once(std::function<void()> action);

@@ -499,6 +499,30 @@ TEST(CollectLogTest, FailsWhenTheNewLinesCannotBeWritten) {
   EXPECT_FALSE(Exists(kLogUpdateFile));
 }
 
+TEST(CollectLogTest, FailsWhenTheNewLinesCannotBeReadBack) {
+  const std::string conf = InstallCollected("one\n");
+  AppendFile(kLog, "two\n");
+  // The output's last byte is read to complete the line, and again to find where it begins.
+  OnFileCalls().pread = [read = 0](size_t& count) mutable {
+    errno = EIO;
+    return count != 1 || ++read != 2;
+  };
+  EXPECT_EQ(Collect(), 0);
+  EXPECT_THAT(Log(), LoggedInOrder(std::string("Failed to collect diff log '") + kLog + "'",
+                                   FailedIn(conf)));
+  EXPECT_FALSE(Exists(kLogUpdateFile));
+}
+
+TEST(CollectLogTest, FailsWhenTheNewLinesAreLostAtTheEnd) {
+  const std::string conf = InstallCollected("one\n");
+  AppendFile(kLog, "two\n");
+  OnFileCalls().close = [](int file) { return PathOfDescriptor(file) != kOutput; };
+  EXPECT_EQ(Collect(), 0);
+  EXPECT_THAT(Log(), LoggedInOrder(std::string("Failed to collect diff log '") + kLog + "'",
+                                   FailedIn(conf)));
+  EXPECT_FALSE(Exists(kLogUpdateFile));
+}
+
 TEST(CollectLogTest, FailsWhenTheStateOfAContinuedLogCannotBeStaged) {
   const std::string conf = InstallCollected("one\n");
   AppendFile(kLog, "two\n");
@@ -673,6 +697,17 @@ TEST(CollectLogTest, FailsWhenTheSnapshotCannotBeAppended) {
     OnFileCalls().copy_file_range = onceThereIsASnapshot;
     OnFileCalls().sendfile = onceThereIsASnapshot;
     OnFileCalls().write = onceThereIsASnapshot;
+  });
+  EXPECT_THAT(Log(), LoggedInOrder(std::string("Failed to collect log '") + kLog + "'",
+                                   std::string("Failed to collect whole log '") + kLog + "'",
+                                   FailedIn(conf)));
+}
+
+TEST(CollectLogTest, FailsWhenTheEndOfTheSnapshotIsLost) {
+  const std::string conf = SpoilAppending([] {
+    OnFileCalls().close = [](int file) {
+      return PathOfDescriptor(file) != kOutput || !Exists(kOutput + ".tmp");
+    };
   });
   EXPECT_THAT(Log(), LoggedInOrder(std::string("Failed to collect log '") + kLog + "'",
                                    std::string("Failed to collect whole log '") + kLog + "'",
