@@ -723,22 +723,34 @@ TEST(CollectLogTest, GoesOnWhenTheSnapshotCannotBeRemoved) {
   EXPECT_EQ(Delivered()["m"], "two\nthree\n");
 }
 
+// With ".tmp" behind it, an output's path of 251 bytes fills the buffer; longer ones are cut.
 TEST(CollectLogTest, RefusesASnapshotNameThatDoesNotFit) {
-  // The output's path has 253 bytes; with ".tmp" it would be cut to 255.
-  const std::string folder = "/tmp/" + std::string(246, 'd');
-  const std::string output = folder + "/m";
   const std::string conf = Install();
   WriteFile(kLog, "one\n");
-  WriteFile(output, "before\n");
   fs::create_directories("/tmp/quendel");
-  ASSERT_EQ(output.size(), 253u);
-  EXPECT_EQ(QUENDELCollectLog(folder.c_str()), 0);
-  EXPECT_EQ(ReadFile(output), "before\n");
-  EXPECT_THAT(
-      Log(),
-      LoggedInOrder(std::string("Failed to copy log '") + kLog + "' to " + Quoted(output + ".t"),
-                    std::string("Failed to collect log '") + kLog + "'",
-                    std::string("Failed to collect whole log '") + kLog + "'", FailedIn(conf)));
+  const struct {
+    size_t length;
+    const char* cut;
+  } outputs[] = {{251, nullptr}, {252, ".tm"}, {253, ".t"}, {255, ""}};
+  for (const auto& [length, cut] : outputs) {
+    const std::string folder = "/tmp/" + std::string(length - 7, 'd');
+    const std::string output = folder + "/m";
+    ASSERT_EQ(output.size(), length);
+    WriteFile(output, "before\n");
+    ClearLog();
+    EXPECT_EQ(QUENDELCollectLog(folder.c_str()), 0);
+    if (cut == nullptr) {
+      EXPECT_EQ(ReadFile(output), "before\none\n");
+      EXPECT_THAT(Log(), IsEmpty());
+      continue;
+    }
+    EXPECT_EQ(ReadFile(output), "before\n");
+    EXPECT_THAT(
+        Log(),
+        LoggedInOrder(std::string("Failed to copy log '") + kLog + "' to " + Quoted(output + cut),
+                      std::string("Failed to collect log '") + kLog + "'",
+                      std::string("Failed to collect whole log '") + kLog + "'", FailedIn(conf)));
+  }
 }
 
 // ---- Archives ----
@@ -1004,7 +1016,7 @@ TEST(CollectLogTest, GoesOnWhenScratchCopiesCannotBeRemoved) {
                                        ".1.xz [errno=" + std::to_string(EPERM) + "]"));
 }
 
-// A name of 249 bytes, with ".1.xz" behind it, fills the buffer exactly; of 251 it does not fit,
+// A name of 250 bytes, with ".1.xz" behind it, fills the buffer exactly; of 251 it does not fit,
 // and cut it would be taken for an archive for ever.
 TEST(CollectLogTest, SeesNoArchivesOfALogWhoseNameIsTooLong) {
   for (const size_t length : {size_t{250}, size_t{251}, size_t{255}}) {
@@ -1014,6 +1026,7 @@ TEST(CollectLogTest, SeesNoArchivesOfALogWhoseNameIsTooLong) {
     const std::string conf = InstallLog("m", log);
     WriteFile(log, "one\n");
     WriteFile(ArchiveOf(log, 1), "no archive");
+    WriteFile(log + ".1.x", "no archive");  // what the name of 251 bytes would be cut to
     ClearLog();
     EXPECT_EQ(Collect(), 0);
     EXPECT_THAT(Delivered(), Contains(Pair("m", "one\n"))) << length;
