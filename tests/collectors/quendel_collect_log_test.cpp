@@ -141,9 +141,11 @@ TEST(CollectLogTest, FailsWithoutMemoryForTheNames) {
 
 TEST(CollectLogTest, FailsWhenTheConfigurationsCannotBeListed) {
   Install();
+  WriteFile(kLogUpdateFile, "[/x]\nlast_hash=old\n");
   FailCall("ALIBCFileEnumDir", 1, -1);
   EXPECT_EQ(Collect(), -1);
   EXPECT_THAT(Log(), LoggedInOrder("Failed to enum dir '/usr/arvo/etc/quendel'"));
+  EXPECT_FALSE(Exists(kLogUpdateFile)) << "what an earlier run staged goes first";
 }
 
 TEST(CollectLogTest, DoesNothingWithoutACollector) {

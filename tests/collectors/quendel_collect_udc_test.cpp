@@ -125,17 +125,21 @@ TEST(CollectUDCTest, FailsWithoutMemoryForTheNames) {
 }
 
 TEST(CollectUDCTest, FailsWithoutMemoryForTheState) {
+  WriteFile(kUpdateFile, "[/x]\nlast_hash=old\n");
   FailCall("ALIBCSzHashAlloc", 1, 0);
   EXPECT_EQ(Collect(), -1);
   EXPECT_THAT(Log(), LoggedInOrder("Failed to allocate memory for UDC hash"));
   EXPECT_FALSE(Exists(kResult));
+  EXPECT_TRUE(Exists(kUpdateFile)) << "what an earlier run staged is not looked at yet";
 }
 
 TEST(CollectUDCTest, FailsWhenTheConfigurationsCannotBeListed) {
+  WriteFile(kUpdateFile, "[/x]\nlast_hash=old\n");
   FailCall("ALIBCFileEnumDir", 1, -1);
   EXPECT_EQ(Collect(), -1);
   EXPECT_THAT(Log(), LoggedInOrder("Failed to enum dir '/usr/arvo/etc/quendel'"));
   EXPECT_FALSE(Exists(kResult));
+  EXPECT_FALSE(Exists(kUpdateFile)) << "what an earlier run staged goes first";
 }
 
 TEST(CollectUDCTest, AsksForItsContainersInTheirSizes) {
