@@ -297,6 +297,22 @@ TEST(CollectLogTest, LeavesLinesThatArriveMeanwhileToTheNextRun) {
   EXPECT_EQ(Delivered()["m"], "third\n");
 }
 
+// The size that the log had when the run came to it bounds what is copied, not that of the file
+// that is then opened.
+TEST(CollectLogTest, LeavesLinesThatArriveBeforeTheLogIsOpenedToTheNextRun) {
+  InstallCollected("first\n");
+  AppendFile(kLog, "second\n");
+  OnFileCalls().stat = [asked = 0](const char* path, struct stat&) mutable {
+    if (path == std::string(kLog) && ++asked == 2) {
+      AppendFile(kLog, "third\n");
+    }
+  };
+  CollectAndCommit();
+  EXPECT_EQ(Delivered()["m"], "second\n");
+  CollectAndCommit();
+  EXPECT_EQ(Delivered()["m"], "third\n");
+}
+
 TEST(CollectLogTest, LosesNothingOfALogThatIsRotatedWhileItIsCopied) {
   InstallCollected("first\n");
   AppendFile(kLog, "second\n");
