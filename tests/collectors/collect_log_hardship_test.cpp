@@ -239,6 +239,38 @@ TEST(CollectLogTest, DoesNotWaitForAFifoInThePlaceOfAnArchive) {
   EXPECT_EQ(Delivered()["m"], "second\n");
 }
 
+TEST(CollectLogTest, PassesOverADirectoryInThePlaceOfTheOldestNewArchive) {
+  InstallCollected("first\n");
+  AppendFile(kLog, "second\n");
+  fs::create_directory(ArchiveOf(kLog, 1));
+  EXPECT_EQ(Collect(), 0);
+  EXPECT_THAT(Log(), LoggedInOrder("Failed to copy '" + ArchiveOf(kLog, 1) + "' to '" + kOutput +
+                                   ".1.xz'"));
+  EXPECT_EQ(Delivered()["m"], "second\n");
+}
+
+TEST(CollectLogTest, FailsALogOfWhichANewerArchiveIsNoFile) {
+  InstallCollected("first\n");
+  AppendFile(kLog, "second\n");
+  Rotate(kLog);
+  Rotate(kLog);
+  const std::string archive = ArchiveOf(kLog, 1);
+  for (const bool isFifo : {true, false}) {
+    RemoveFile(archive);
+    if (isFifo) {
+      ASSERT_EQ(mkfifo(archive.c_str(), 0600), 0);
+    } else {
+      fs::create_directory(archive);
+    }
+    ClearLog();
+    alarm(20);
+    EXPECT_EQ(Collect(), 0);
+    EXPECT_THAT(Log(), LoggedInOrder("Failed to copy '" + archive + "' to '" + kOutput + ".1.xz'",
+                                     "Failed to collect tared log of '" + kConf + "'", kLogFailed));
+    EXPECT_FALSE(Exists(kLogUpdateFile));
+  }
+}
+
 TEST(CollectLogTest, TakesALoopOfLinksForAMissingLog) {
   InstallLog("m", kLog);
   fs::create_symlink("/volume1/other", kLog);
