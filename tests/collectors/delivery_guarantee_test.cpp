@@ -5,6 +5,7 @@
 #include <sys/stat.h>
 
 #include <filesystem>
+#include <utility>
 
 #include "collectors/file_calls.h"
 #include "model/collector_files.h"
@@ -163,6 +164,28 @@ TEST(DeliveryGuaranteeTest, LinesAreLostInArchivesOfALogWithALongPath) {
   EXPECT_TRUE(HasArrived("two"));
 }
 
+// The higher an archive's number, the longer its ending.
+TEST(DeliveryGuaranteeTest, LinesAreLostInArchiveTenOfALogWithALongPath) {
+  for (const size_t length : {size_t{249}, size_t{250}}) {
+    const std::string folder = "/volume1/" + std::string(200, 'd') + "/";
+    const std::string log = folder + std::string(length - folder.size(), 'l');
+    RemoveFile(folder);
+    InstallLog("m", log);
+    WriteFile(log, "one\n");
+    Deliver();
+    const std::string line = "in ten of " + std::to_string(length);
+    AppendFile(log, line + "\n");
+    for (int i = 0; i < 10; ++i) {
+      Rotate(log);
+      AppendFile(log, "two " + std::to_string(i) + "\n");
+    }
+    Deliver();
+    Deliver();
+    EXPECT_EQ(HasArrived(line), length == 249) << length;
+    EXPECT_TRUE(HasArrived("two 0"));
+  }
+}
+
 // ---- Taken for collected ----
 
 TEST(DeliveryGuaranteeTest, LinesAreLostInAnArchiveThatBearsTheInodeOfAnEarlierOne) {
@@ -242,6 +265,28 @@ TEST(DeliveryGuaranteeTest, LinesAreLostInANewerArchiveThatIsStillBeingWritten) 
   EXPECT_TRUE(HasArrived("two"));
 }
 
+TEST(DeliveryGuaranteeTest, LinesAreLostInAnArchiveThatIsRenumberedInTheRun) {
+  InstallCollected("one\n");
+  AppendFile(kLog, "two\n");
+  Rotate(kLog);
+  AppendFile(kLog, "three\n");
+  Deliver();
+  AppendFile(kLog, "lost\n");
+  Rotate(kLog);
+  AppendFile(kLog, "four\n");
+  // An archive is asked for whether it is there, and then for its inode. That of the last one
+  // ends the look at them.
+  OnFileCalls().stat = [asked = 0](const char* path, struct stat&) mutable {
+    if (path == ArchiveOf(kLog, 2) && ++asked == 2) {
+      Rotate(kLog);
+      AppendFile(kLog, "five\n");
+    }
+  };
+  Deliver();
+  EXPECT_FALSE(ArrivesLater("lost"));
+  EXPECT_TRUE(HasArrived("four")) << "it is sent instead";
+}
+
 // ---- Taken for a continuation ----
 
 TEST(DeliveryGuaranteeTest, LinesAreLostBeforeALastLineThatRecursAtItsPlace) {
@@ -306,6 +351,24 @@ TEST(DeliveryGuaranteeTest, LinesAreLostOfAnArchiveWhenTheLiveLogContinues) {
   EXPECT_FALSE(ArrivesLater("lost"));
 }
 
+// The archives were looked for before the rotation, the live log after it.
+TEST(DeliveryGuaranteeTest, LinesAreLostOfAnArchiveThatBeginsLikeTheLiveLog) {
+  InstallCollected("header\nA\n");
+  AppendFile(kLog, "lost\n");
+  OnFileCalls().stat = [rotated = false](const char* path, struct stat& status) mutable {
+    if (path == std::string(kLog) && !std::exchange(rotated, true)) {
+      Rotate(kLog);
+      AppendFile(kLog, "header\n");
+      stat(kLog, &status);
+    }
+  };
+  Deliver();
+  AppendFile(kLog, "two\n");
+  Deliver();
+  EXPECT_TRUE(HasArrived("two"));
+  EXPECT_FALSE(ArrivesLater("lost"));
+}
+
 TEST(DeliveryGuaranteeTest, LinesAreLostOfTwoLogsWithOneName) {
   InstallCollected("one\n");
   const std::string other = InstallLog("n", "/volume1/n");
@@ -352,6 +415,19 @@ TEST(DeliveryGuaranteeTest, LinesAreLostThatACallerCommitsAfterARunThatFailed) {
   FailCall("ALIBCSzListAlloc", 1, 0);
   EXPECT_EQ(Collect(), -1);
   Commit();  // what is committed is the state of the run before
+  EXPECT_FALSE(ArrivesLater("lost"));
+}
+
+TEST(DeliveryGuaranteeTest, LinesAreLostOfASecondRunThatTheFirstOneCommits) {
+  InstallCollected("one\n");
+  AppendFile(kLog, "two\n");
+  EXPECT_EQ(Collect(), 0);
+  const std::string ofTheFirst = Delivered()["m"];
+  AppendFile(kLog, "lost\n");
+  EXPECT_EQ(Collect(), 0);  // the second, which is never delivered
+  Arrived() += ofTheFirst;
+  Commit();
+  EXPECT_TRUE(HasArrived("two"));
   EXPECT_FALSE(ArrivesLater("lost"));
 }
 
