@@ -722,12 +722,16 @@ TEST(StartCollectTest, CleansUpInACallerThatSurvivesTheSignal) {
 TEST(StartCollectTest, EndsAndReapsAChildOfTheCallersGroup) {
   const Ending ending = RunIgnoringSigterm([] {
     FailCall("time", 1, -1);
+    // The child starts with its action set, and misses no signal.
+    MaskSigterm(SIG_BLOCK);
+    signal(SIGTERM, SIG_DFL);
     const pid_t other = fork();
     if (other == 0) {
-      signal(SIGTERM, SIG_DFL);
+      MaskSigterm(SIG_UNBLOCK);
       Hang(nullptr);
     }
-    usleep(100000);  // for its action to be set
+    signal(SIGTERM, SIG_IGN);
+    MaskSigterm(SIG_UNBLOCK);
     const int result = Collect();
     EXPECT_EQ(kill(other, 0), -1);
     return result;
