@@ -34,7 +34,8 @@
 //  * it reaps whichever child of the process ends, and a foreign one that ends meanwhile fails the
 //    run;
 //  * a run that fails before both of its children were started sends SIGTERM to the whole process
-//    group of the caller, the caller included;
+//    group of the caller, the caller included. One that this ends leaves the run directory and the
+//    marker file of a child that was started, whatever `removeAfter` says: its parent removes them;
 //  * it fails when the process ignores SIGCHLD;
 //  * a child that does not end after SIGTERM keeps it from returning.
 // One run at a time on a device: runs share the files in which they note what they collected.

@@ -741,6 +741,37 @@ TEST(StartCollectTest, EndsAndReapsAChildOfTheCallersGroup) {
               ElementsAre(Logged(kUnit, "Failed to get current time"), NothingToWaitFor("log")));
 }
 
+// A caller that SIGTERM ends does not come to the rest of the clean-up.
+TEST(StartCollectTest, LeavesItsFilesToTheParentOfACallerThatTheSignalEnds) {
+  StopTheClock();
+  InstallCollectors();
+  const auto before = CollectorConf();
+  const Ending ending = InAGroupOfItsOwn([] {
+    FailCall("mkdir", 3, -1, ENOSPC);
+    return Collect(1);
+  });
+  EXPECT_EQ(ending.signal, SIGTERM);
+  EXPECT_TRUE(Exists(kRunDir));
+  EXPECT_THAT(LeftInWorkRoot(), IsEmpty());
+  EXPECT_EQ(CollectorConf(), before);
+}
+
+TEST(StartCollectTest, LeavesAMarkerToTheParentOfACallerThatTheSignalEnds) {
+  StopTheClock();
+  InstallCollectors();
+  const auto before = CollectorConf();
+  const Ending ending = InAGroupOfItsOwn([] {
+    FailCall("ALIBCProcForkEx", 2, -1);
+    ReplaceCollector("udc", Hang);
+    return Collect(1);
+  });
+  EXPECT_EQ(ending.signal, SIGTERM);
+  EXPECT_TRUE(Exists(kRunDir));
+  EXPECT_THAT(LeftInWorkRoot(), ElementsAre(StartsWith("udc.p.")));
+  EXPECT_EQ(kill(ChildOf("udc"), 0), -1) << "the child it names has ended";
+  EXPECT_EQ(CollectorConf(), before);
+}
+
 TEST(StartCollectTest, FailsWhenADirectoryCannotBeMade) {
   const std::vector<std::pair<std::string, std::string>> directories = {
       {"UDC", quendel::kWorkRoot},
