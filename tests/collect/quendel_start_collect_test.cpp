@@ -187,6 +187,13 @@ TEST(StartCollectTest, MakesItsDirectoriesForTheOwnerOnly) {
   EXPECT_EQ(ModeOf(quendel::kWorkRoot), S_IFDIR | 0700U);
 }
 
+TEST(StartCollectTest, MakesTheWorkRootWhenItCannotBeTold) {
+  FailCall("ALIBCFileCheckDir", 1, -1);
+  EXPECT_EQ(Collect(), 0);
+  EXPECT_EQ(ModeOf(quendel::kWorkRoot), S_IFDIR | 0700U);
+  EXPECT_THAT(Log(), IsEmpty());
+}
+
 TEST(StartCollectTest, LeavesAWorkRootThatIsThereAsItIs) {
   ASSERT_EQ(mkdir(quendel::kWorkRoot, 0750), 0);
   Record("mkdir");
@@ -418,6 +425,31 @@ TEST(StartCollectTest, GoesOnWhenTheSeriesCannotBeWritten) {
   EXPECT_THAT(Log(), SizeIs(13));
   EXPECT_THAT(Log(), Contains(Logged(kUnit, "Error occured when parse perf data")));
   EXPECT_EQ(ArchiveEntries(kArchive).count(std::string(kRunName) + "/log/messages"), 1U);
+}
+
+TEST(StartCollectTest, WritesTheSeriesWhileItsChildrenRun) {
+  StopTheClock();
+  WaitLimit("1");
+  ReplaceCollector("udc", Hang);
+  ReplaceCollector("log", Hang);
+  bool seen = false;
+  OnSleep([&] { seen = Exists(std::string(kRunDir) + "/perf/quendel.perf.Memory"); });
+  EXPECT_EQ(QUENDELStartCollect(1, 0, PerfSeries()), -1);
+  EXPECT_TRUE(seen);
+}
+
+TEST(StartCollectTest, WritesNoSeriesBeforeItHasBothChildren) {
+  for (const int nth : {1, 2}) {
+    RemoveFile(kRunDir);
+    const Ending ending = RunIgnoringSigterm([nth] {
+      StopTheClock();
+      FailCall("ALIBCProcForkEx", nth, -1);
+      return Collect();
+    });
+    EXPECT_EQ(ending.result, -1);
+    EXPECT_TRUE(Exists(std::string(kRunDir) + "/perf"));
+    EXPECT_FALSE(Exists(std::string(kRunDir) + "/perf/quendel.perf.Memory")) << nth;
+  }
 }
 
 TEST(StartCollectTest, TakesAnyKindOfSeries) {
@@ -903,6 +935,41 @@ TEST(StartCollectTest, TellsWhenTheArchiveCannotBeRemoved) {
                                  Logged(kUnit, "Failed to remove " + std::string(kArchive) +
                                                    " [errno=39]")));
   EXPECT_FALSE(Exists(kRunDir));
+}
+
+// Each step of the clean-up has something to tell.
+TEST(StartCollectTest, CleansUpInItsOrder) {
+  StopTheClock();
+  WaitLimit("1");
+  WriteFile(std::string(kArchive) + "/in-its-place", "");
+  FailCall("ALIBCopyRemoveDir", 1, -1, EBUSY);
+  std::vector<testing::Matcher<LogLine>> stopped;
+  std::vector<testing::Matcher<LogLine>> marked;
+  OnSleep([&] {
+    for (const std::string kind : {"udc", "log"}) {
+      const pid_t child = ChildOf(kind);
+      const std::string marker = "/tmp/quendel/" + kind + ".p." + std::to_string(child);
+      siginfo_t ended;
+      ASSERT_EQ(kill(child, SIGSTOP), 0);
+      ASSERT_EQ(waitid(P_PID, static_cast<id_t>(child), &ended, WSTOPPED | WNOWAIT), 0);
+      RemoveFile(marker);
+      WriteFile(marker + "/a-folder-now", "");
+      stopped.push_back(
+          Logged(kUnit, std::to_string(child) + " status " + std::to_string(W_STOPCODE(SIGSTOP))));
+      marked.push_back(Logged(kUnit, "Failed to remove " + marker + " [errno=39]"));
+    }
+  });
+  ReplaceCollector("udc", Hang);
+  ReplaceCollector("log", Hang);
+  EXPECT_EQ(QUENDELStartCollect(1, 0, PerfSeries()), -1);
+  ASSERT_THAT(stopped, SizeIs(2));
+  EXPECT_THAT(
+      Log(),
+      ElementsAre(Logged(kUnit, "Timeout when wait child done"), stopped[0], stopped[1], marked[0],
+                  marked[1],
+                  Logged(kUnit, "Error happened when remove " + std::string(kRunDir) +
+                                    ", errno:16 [Device or resource busy]"),
+                  Logged(kUnit, "Failed to remove " + std::string(kArchive) + " [errno=39]")));
 }
 
 // Whatever ends a run before its archive is made, the next run finds the same to collect.
