@@ -46,8 +46,7 @@ QUENDEL_EXPORT int QUENDELStartCollect(int removeAfter, int sendToServer,
                                        const Json::Value& perfSeries);
 
 // How long a collection run waits for its children, in seconds: key "quendel_wait_collect_timeout"
-// of
-// "/etc.defaults/arvoinfo.conf", of which the first seven characters count, read as a decimal
+// of "/etc.defaults/arvoinfo.conf", of which the first seven characters count, read as a decimal
 // number. 600 when the key is missing or the number is less than 1.
 //
 // The file is read at the first call only. What that read gave stays for the life of the process.
@@ -88,8 +87,8 @@ QUENDEL_EXPORT int QUENDELParsePerfJson(const char* dir, const Json::Value& seri
 QUENDEL_EXPORT int QUENDELTarCollectData(const char* dir, const char* archive);
 
 // Posts an archive to the server, with its description: file name, device time zone, operating
-// system version, and `timestamp`, the start of the run in seconds since the epoch, as a number and
-// as local time.
+// system version, and `timestamp`, the start of the run in seconds since the epoch, as a text of
+// decimal digits and as local time.
 //
 // Needs a signed-in cloud account and a serial number. When the time zone or the version cannot be
 // read, the archive is posted without a description.

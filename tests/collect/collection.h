@@ -35,8 +35,7 @@ Json::Value PerfSeries();
 void ReplaceCollector(const std::string& kind, std::function<int(const char*)> work);
 
 // Collectors for that: one that never ends, one that does nothing, one that ends when there is a
-// file
-// "/tmp/end", one that dies.
+// file "/tmp/end", one that dies.
 int Hang(const char* directory);
 int DoNothing(const char* directory);
 int EndWhenTold(const char* directory);
