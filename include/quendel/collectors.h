@@ -82,8 +82,10 @@ QUENDEL_EXPORT int QUENDELUpdateCollectConf(const char* path);
 // collection that was last committed, and stages the new state of each.
 //
 // New lines, or the whole live log when it was replaced or rewritten, go to the file named by the
-// log's "name"; new archives (the log's path and ".1.xz", ".2.xz" and so on without a gap) beside
-// it, with the same endings. Memory use does not depend on the size of a log or of a line.
+// log's "name". Archives are the log's path and ".1.xz", ".2.xz" and so on without a gap. The
+// oldest new one gives that file its new lines, before those of the log, when the last line
+// collected is found in it. Otherwise it goes beside that file whole, with the same ending, as
+// every other new archive does. Memory use does not depend on the size of a log or of a line.
 //
 // A log that cannot be collected is logged, keeps its state and does not keep the others from
 // theirs. Not for several threads or processes at once: the staged state has one fixed place.
@@ -101,8 +103,8 @@ QUENDEL_EXPORT int QUENDELCollectLog(const char* dstDir);
 // Standard output is all that counts: the exit status is not looked at. The output is held in
 // memory whole. Not for several threads or processes at once: the staged state has one fixed place.
 //
-// Returns 0 when the result file was written, whatever happened to single collectors, else -1 with
-// nothing staged.
+// Returns 0 when the result file was written, whatever happened to single collectors, else -1;
+// nothing of this run is staged then, but what an older one staged may still be.
 QUENDEL_EXPORT int QUENDELCollectUDC(const char* dstDir);
 
 #endif  // QUENDEL_COLLECTORS_H_
