@@ -236,7 +236,7 @@ class History {
   }
 
   ModelFault RandomFault() {
-    // The first four cost no line even of a log that is rotated well.
+    // The first seven cost no line even of a log that is rotated well.
     static const char* const kCalls[] = {
         "ALIBCSzHashSetValue", "ALIBCSzListPush",  "ALIBCStrTok", "ALIBCFileAddSection",
         "ALIBCSzListAlloc",    "ALIBCSzHashAlloc", "calloc",      "ARVOFileCopy",
