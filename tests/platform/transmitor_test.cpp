@@ -268,6 +268,16 @@ TEST(TransmitorTest, LeavesOtherFileSystemsOut) {
   }
 }
 
+// One that has gone away would not answer.
+TEST(TransmitorTest, AsksNoFileSystemOfAServer) {
+  mkdir("/volume7", 0700);
+  for (const char* source : {"server:/export", "user@server:/export", "//server/share"}) {
+    ASSERT_EQ(mount(source, "/volume7", "tmpfs", 0, nullptr), 0);
+    EXPECT_TRUE(Named(Figures()["SpaceIO"], "/volume7").isNull()) << source;
+    ASSERT_EQ(umount("/volume7"), 0);
+  }
+}
+
 TEST(TransmitorTest, DecodesNamesOfVolumes) {
   mkdir("/volume7", 0700);
   ASSERT_EQ(mount("/dev/not here", "/volume7", "tmpfs", 0, nullptr), 0);

@@ -232,8 +232,13 @@ Json::Value DiskFigures() {
   return disks;
 }
 
-// A volume is a file system on a local block device, or whatever is mounted as "/volume<n>". Others
-// are not asked: a server that has gone away would hold the answer up.
+// Whether the source of a file system is "host:/path" or "//host/share".
+bool IsOfAServer(std::string_view source) {
+  return source.substr(0, 2) == "//" || source.find(":/") != std::string_view::npos;
+}
+
+// A volume is a file system on a local block device, or whatever is mounted as "/volume<n>" and
+// does not come from a server: one that has gone away would hold the answer up.
 bool IsVolume(const mntent& mount) {
   const std::string_view directory = mount.mnt_dir;
   constexpr std::string_view kDevicePrefix = "/dev/";
@@ -241,7 +246,8 @@ bool IsVolume(const mntent& mount) {
   if (std::string_view(mount.mnt_fsname).substr(0, kDevicePrefix.size()) == kDevicePrefix) {
     return true;
   }
-  return directory.substr(0, kVolumePrefix.size()) == kVolumePrefix &&
+  return !IsOfAServer(mount.mnt_fsname) &&
+         directory.substr(0, kVolumePrefix.size()) == kVolumePrefix &&
          directory.size() > kVolumePrefix.size() &&
          directory.find_first_not_of("0123456789", kVolumePrefix.size()) == std::string_view::npos;
 }
