@@ -41,16 +41,23 @@ bool MakeSshDir() {
 
 // The support account owns its home, so whoever held it before may have put a link in place of the
 // folder or of the file, to have root write somewhere else. A FIFO would make the open wait for
-// ever.
+// ever. What was there is not emptied before it is known.
 int OpenKeyFile() {
   const int folder = open(kSupportSshDir, O_PATH | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC);
   if (folder < 0) {
     return -1;
   }
   const int file = openat(folder, kAuthorizedKeysName,
-                          O_WRONLY | O_CREAT | O_TRUNC | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC, 0666);
+                          O_WRONLY | O_CREAT | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC, 0666);
   close(folder);
   return file;
+}
+
+// Refuses a file that has another name somewhere else, and whatever cannot be emptied because it is
+// no plain file: a FIFO that somebody reads was opened.
+bool EmptyPlainFile(int file) {
+  struct stat status;
+  return fstat(file, &status) == 0 && status.st_nlink == 1 && ftruncate(file, 0) == 0;
 }
 
 std::FILE* OpenKeyStream() {
@@ -58,7 +65,7 @@ std::FILE* OpenKeyStream() {
   if (fd < 0) {
     return nullptr;
   }
-  std::FILE* stream = fdopen(fd, "w");
+  std::FILE* stream = EmptyPlainFile(fd) ? fdopen(fd, "w") : nullptr;
   if (stream == nullptr) {
     close(fd);
   }

@@ -1,4 +1,5 @@
 // The support account: its home, its key, its end.
+#include <fcntl.h>
 #include <gmock/gmock.h>
 #include <pwd.h>
 #include <sys/resource.h>
@@ -180,6 +181,28 @@ TEST(SupportAccountUserCreateTest, DoesNotWaitForTheReaderOfAFifo) {
   EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), -1);
   EXPECT_THAT(Log(),
               ElementsAre(Logged(kUnit, "Failed to open '/run/quendelhome/.ssh/authorized_keys'")));
+}
+
+TEST(SupportAccountUserCreateTest, RefusesAFifoThatIsRead) {
+  MakeSshDir();
+  ASSERT_EQ(mkfifo(kKeyFile, 0644), 0);
+  const int reader = open(kKeyFile, O_RDONLY | O_NONBLOCK);
+  ASSERT_GE(reader, 0);
+  EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), -1);
+  EXPECT_THAT(Log(),
+              ElementsAre(Logged(kUnit, "Failed to open '/run/quendelhome/.ssh/authorized_keys'")));
+  char byte = 0;
+  EXPECT_EQ(read(reader, &byte, 1), 0);  // nobody wrote the key
+}
+
+TEST(SupportAccountUserCreateTest, LeavesAFileAloneThatHasAnotherName) {
+  MakeSshDir();
+  WriteFile("/run/other", "theirs");
+  ASSERT_EQ(link("/run/other", kKeyFile), 0);
+  EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), -1);
+  EXPECT_THAT(Log(),
+              ElementsAre(Logged(kUnit, "Failed to open '/run/quendelhome/.ssh/authorized_keys'")));
+  EXPECT_EQ(ReadFile("/run/other"), "theirs");
 }
 
 TEST(SupportAccountUserCreateTest, FailsWhenTheKeyCannotBeWritten) {
