@@ -46,9 +46,12 @@ QUENDEL_EXPORT int QUENDELSendUploadData(int actionId,
 
 // Prepares the local account `user` for the vendor's support staff: its home, "/run/quendelhome",
 // belongs to user ID 50001 and group ID 100, and `key`, one or more lines of an OpenSSH
-// authorized_keys file, is the only key that opens it. The key is written as it stands, without a
-// line end of its own; an empty one is allowed. Neither the key file nor its folder may be a
-// symbolic link. Calling it again replaces the key. Needs root.
+// authorized_keys file, opens it. The key is written as it stands, without a line end of its own;
+// an empty one is allowed. A symbolic link in place of the key file or its folder is refused, and
+// so is a key file that is not a plain file or has a second name.
+//
+// Calling it again writes another key, but what an earlier holder left in the home stays; call
+// QUENDELSupportAccountUserDelete() first. Needs root.
 //
 // Returns 0, or -1 with whatever was made so far left in place; QUENDELSupportAccountUserDelete()
 // clears it away.
