@@ -153,18 +153,16 @@ std::vector<QUENDELSendDataParam_t> PrepareFiles(const Json::Value& files, const
   return prepared;
 }
 
-int ReportNoFile(int actionId) {
-  if (QUENDELUpdateActRequestProgress(actionId, QUENDEL_ACT_PROGRESS_NO_FILE,
-                                      Json::Value(Json::objectValue)) < 0) {
-    QUENDEL_LOG("Failed to update progress to server");
-    return -1;
-  }
-  return 0;
+bool ReportNoFile(int actionId) try {
+  return QUENDELUpdateActRequestProgress(actionId, QUENDEL_ACT_PROGRESS_NO_FILE,
+                                         Json::Value(Json::objectValue)) >= 0;
+} catch (...) {
+  return false;
 }
 
 // Does everything the request asks for. Leaves in tempDir the directory that is to be removed, of
-// which there is only one. Deliberate: of two kinds of file, the kind prepared first leaves its
-// own.
+// which there is only one.
+// Deliberate: of two kinds of file, the kind prepared first leaves its own directory.
 int AnswerRequest(int actionId, const Json::Value& files, const char*& tempDir) try {
   if (!PathsAreValid(files)) {
     QUENDEL_LOG("Validate filepath failed");
@@ -176,7 +174,11 @@ int AnswerRequest(int actionId, const Json::Value& files, const char*& tempDir) 
   }
   const std::vector<QUENDELSendDataParam_t> prepared = PrepareFiles(files, tempDir);
   if (prepared.empty()) {
-    return ReportNoFile(actionId);
+    if (!ReportNoFile(actionId)) {
+      QUENDEL_LOG("Failed to update progress to server");
+      return -1;
+    }
+    return 0;
   }
   if (QUENDELSendUploadData(actionId, prepared) < 0) {
     QUENDEL_LOG("Send collect data fail");
