@@ -198,7 +198,7 @@ TEST(LocalAccountUserDeleteTest, TellsAnUnknownAccountByItsCode) {
 
 TEST(LocalAccountUserDeleteTest, RefusesAccountsOfTheSystem) {
   const std::string before = ReadFile("/etc/passwd");
-  for (const char* name : {"root", "daemon", "sshd"}) {
+  for (const char* name : {"root", "daemon", "sshd", "nobody"}) {
     Result result;
     EXPECT_LT(Delete(name, result), 0) << name;
     EXPECT_EQ(result.FirstError(), 0x0b00);

@@ -30,8 +30,9 @@ constexpr char kSupportShell[] = "/bin/sh";
 // No password matches this one, and it does not lock the account: a key still lets in.
 constexpr char kNoPassword[] = "*";
 
-// Below are the accounts that the system itself needs.
+// Below are the accounts that the system itself needs. Another one that it needs is far above.
 constexpr uid_t kFirstOwnUid = 1000;
+constexpr uid_t kNobodyUid = 65534;
 constexpr size_t kMaxNameBytes = 32;
 
 constexpr char kUserAdd[] = "/usr/sbin/useradd";
@@ -144,7 +145,7 @@ ErrorCode DeleteAccount(const char* name) {
   if (lookup != Lookup::kFound) {
     return lookup == Lookup::kAbsent ? kErrorNoSuchAccount : kErrorUnreadable;
   }
-  if (uid < kFirstOwnUid) {
+  if (uid < kFirstOwnUid || uid == kNobodyUid) {
     return kErrorRefused;
   }
   if (uid != kSupportUid) {
