@@ -1,10 +1,12 @@
-// Calls of the C library that fail where the platform's own operations make them; the kit's fault
-// plan passes those by. A test program that defines one names it to the linker, in the
-// CMakeLists.txt.
+// Calls of the C library that fail, or find something changed, where the platform's own operations
+// make them; the kit's fault plan passes those by. A test program that defines one names it to the
+// linker, in the CMakeLists.txt.
 #ifndef TESTS_PLATFORM_FAILING_CALL_H_
 #define TESTS_PLATFORM_FAILING_CALL_H_
 
 #include <cerrno>
+#include <functional>
+#include <utility>
 
 namespace quendel::test {
 
@@ -21,6 +23,9 @@ class FailingCall {
     reason_ = reason;
   }
 
+  // Has something happen once, just before the next call.
+  void BeforeNext(std::function<void()> action) { action_ = std::move(action); }
+
   // The number of calls from the last Fail() on, or from the start.
   int calls() const { return calls_; }
 
@@ -28,6 +33,9 @@ class FailingCall {
   template <typename Result, typename Real>
   Result Do(Real real) {
     ++calls_;
+    if (action_) {
+      std::exchange(action_, nullptr)();
+    }
     if (!armed_ || (nth_ != 0 && nth_ != calls_)) {
       return real();
     }
@@ -41,6 +49,7 @@ class FailingCall {
   int nth_ = 0;
   long result_ = 0;
   int reason_ = 0;
+  std::function<void()> action_;
 };
 
 }  // namespace quendel::test

@@ -1,24 +1,32 @@
 // The device's own accounts and the result record.
 #include "platform/local_account.h"
 
+#include <dirent.h>
 #include <gmock/gmock.h>
 #include <pwd.h>
 #include <shadow.h>
 #include <signal.h>
 #include <sys/stat.h>
+#include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <string>
+#include <thread>
 #include <vector>
 
+#include "failing_call.h"
 #include "platform/error.h"
 #include "platform/process.h"
 #include "support/appliance.h"
+#include "support/faults.h"
 
 using namespace quendel::test;
 using testing::HasSubstr;
 using testing::Not;
+
+// Ends each look at the list of processes.
+QUENDEL_FAILING_CALL(int, closedir, (DIR * stream), stream)
 
 namespace {
 
@@ -66,8 +74,14 @@ void ExpectSupportAccount(const char* user) {
   EXPECT_EQ(shadow->sp_expire, -1);
 }
 
-// A process of a user, which sleeps until it is ended.
-pid_t StartAs(uid_t uid) {
+void PauseForEver() {
+  for (;;) {
+    pause();
+  }
+}
+
+// A process of a user.
+pid_t StartAs(uid_t uid, void (*body)()) {
   int ready[2];
   EXPECT_EQ(pipe(ready), 0);
   const pid_t child = fork();
@@ -77,15 +91,28 @@ pid_t StartAs(uid_t uid) {
     }
     close(ready[0]);
     close(ready[1]);
-    for (;;) {
-      pause();
-    }
+    body();
   }
   close(ready[1]);
   char byte;
   EXPECT_EQ(read(ready[0], &byte, 1), 0);  // the child has its user
   close(ready[0]);
   return child;
+}
+
+// Returns the signal that ended a process: SIGTERM, which it gets here, when none came before.
+int EndOf(pid_t process) {
+  kill(process, SIGTERM);
+  int status = 0;
+  EXPECT_EQ(waitpid(process, &status, 0), process);
+  return WIFSIGNALED(status) ? WTERMSIG(status) : 0;
+}
+
+void AwaitEndOfFirstThread(pid_t process) {
+  const std::string status = "/proc/" + std::to_string(process) + "/status";
+  while (ReadFile(status).find("\nState:\tZ") == std::string::npos) {
+    std::this_thread::yield();
+  }
 }
 
 }  // namespace
@@ -239,17 +266,58 @@ TEST(LocalAccountUserDeleteTest, ForgetsTheErrorsOfAnEarlierCall) {
 
 TEST(LocalAccountUserDeleteTest, EndsSessionsThatAreStillOpen) {
   ASSERT_EQ(Prepare("support1"), 0);
-  const pid_t session = StartAs(kSupportUid);
-  const pid_t other = StartAs(50002);
+  const pid_t session = StartAs(kSupportUid, PauseForEver);
+  const pid_t other = StartAs(50002, PauseForEver);
   Result result;
   EXPECT_EQ(Delete("support1", result), 0);
   EXPECT_FALSE(AccountExists("support1"));
-  int status = 0;
-  EXPECT_EQ(waitpid(session, &status, 0), session);
-  EXPECT_TRUE(WIFSIGNALED(status));
-  EXPECT_EQ(waitpid(other, &status, WNOHANG), 0);
-  kill(other, SIGKILL);
-  waitpid(other, &status, 0);
+  EXPECT_EQ(EndOf(session), SIGKILL);
+  EXPECT_EQ(EndOf(other), SIGTERM);
+}
+
+// As when a session forks while the list of processes is read.
+TEST(LocalAccountUserDeleteTest, EndsSessionsThatBeginMeanwhile) {
+  ASSERT_EQ(Prepare("support1"), 0);
+  const pid_t session = StartAs(kSupportUid, PauseForEver);
+  pid_t late = 0;
+  closedirCalls.BeforeNext([&] { late = StartAs(kSupportUid, PauseForEver); });
+  Result result;
+  EXPECT_EQ(Delete("support1", result), 0);
+  EXPECT_EQ(EndOf(session), SIGKILL);
+  ASSERT_GT(late, 0);
+  EXPECT_EQ(EndOf(late), SIGKILL);
+}
+
+TEST(LocalAccountUserDeleteTest, DoesNotWaitForProcessesThatHaveEnded) {
+  ASSERT_EQ(Prepare("support1"), 0);
+  const pid_t session = StartAs(kSupportUid, [] { _exit(0); });
+  AwaitEndOfFirstThread(session);
+  Result result;
+  EXPECT_EQ(Delete("support1", result), 0);
+  EXPECT_EQ(closedirCalls.calls(), 1);
+  EXPECT_EQ(EndOf(session), 0);
+}
+
+TEST(LocalAccountUserDeleteTest, EndsAProcessWhoseFirstThreadHasEnded) {
+  ASSERT_EQ(Prepare("support1"), 0);
+  const pid_t session = StartAs(kSupportUid, [] {
+    std::thread(PauseForEver).detach();
+    syscall(SYS_exit, 0);
+  });
+  AwaitEndOfFirstThread(session);
+  Result result;
+  EXPECT_EQ(Delete("support1", result), 0);
+  EXPECT_EQ(EndOf(session), SIGKILL);
+}
+
+TEST(LocalAccountUserDeleteTest, GivesUpOnSessionsThatDoNotEnd) {
+  ASSERT_EQ(Prepare("support1"), 0);
+  const pid_t session = StartAs(kSupportUid, PauseForEver);
+  FailCall("platform:kill", 0, -1, EPERM);
+  Result result;
+  EXPECT_EQ(Delete("support1", result), 0);
+  EXPECT_EQ(closedirCalls.calls(), 10);
+  EXPECT_EQ(EndOf(session), SIGTERM);
 }
 
 TEST(LocalAccountUserDeleteTest, FailsWithoutTheTool) {

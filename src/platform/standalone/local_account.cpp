@@ -35,6 +35,8 @@ constexpr uid_t kFirstOwnUid = 1000;
 constexpr uid_t kNobodyUid = 65534;
 constexpr size_t kMaxNameBytes = 32;
 
+constexpr int kMaxPasses = 10;
+
 constexpr char kUserAdd[] = "/usr/sbin/useradd";
 constexpr char kUserMod[] = "/usr/sbin/usermod";
 constexpr char kUserDel[] = "/usr/sbin/userdel";
@@ -115,23 +117,44 @@ int PrepareSupportAccount(const char* name) {
   return RestoreSupportAccount(name);
 }
 
-// The owner of a process's folder does not tell: a process that changed its user has root's there.
-bool BelongsTo(const std::string& process, const char* uidText) {
-  std::string status;
-  return ReadWholeFile(("/proc/" + process + "/status").c_str(), status) &&
-         status.find(std::string("\nUid:\t") + uidText + "\t") != std::string::npos;
+bool Contains(const std::string& text, const std::string& part) {
+  return text.find(part) != std::string::npos;
 }
 
-// A support session that is still open would outlive its account.
-void EndSupportSessions() {
+// Tells whether a process is the user's. One that has ended, so that only its parent has yet to be
+// told, is nobody's; but its first thread alone may have ended. The owner of its folder does not
+// tell: a process that changed its user has root's there.
+bool BelongsTo(const std::string& process, const char* uidText) {
+  std::string status;
+  if (!ReadWholeFile(("/proc/" + process + "/status").c_str(), status)) {
+    return false;
+  }
+  const bool hasEnded = Contains(status, "\nState:\tZ") && Contains(status, "\nThreads:\t1\n");
+  return !hasEnded && Contains(status, std::string("\nUid:\t") + uidText + "\t");
+}
+
+// Returns false when there was none to be ended.
+bool EndSupportProcesses() {
+  bool hasFound = false;
   const std::unique_ptr<DIR, int (*)(DIR*)> processes(opendir("/proc"), closedir);
   while (const dirent* const entry = processes ? readdir(processes.get()) : nullptr) {
     const std::string name = entry->d_name;
     pid_t process = 0;
     std::from_chars(name.data(), name.data() + name.size(), process);
     if (process > 0 && BelongsTo(name, kSupportUidText)) {
+      hasFound = true;
       kill(process, SIGKILL);
     }
+  }
+  return hasFound;
+}
+
+// A support session that is still open would outlive its account. A process that forks while the
+// list is read may leave a child that is not in it.
+void EndSupportSessions() {
+  int passes = 0;
+  while (passes < kMaxPasses && EndSupportProcesses()) {
+    ++passes;
   }
 }
 
