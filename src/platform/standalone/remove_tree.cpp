@@ -93,6 +93,9 @@ void TreeRemoval::RemoveEntries(Level& level) {
 }
 
 void TreeRemoval::Enter(const std::string& name, Descriptor directory) {
+  if (!directory && errno == ENOENT) {
+    return;  // somebody else was faster
+  }
   struct stat status;
   if (!directory || fstat(directory.get(), &status) != 0) {
     Note(errno);
