@@ -5,15 +5,19 @@
 #include <gmock/gmock.h>
 #include <netinet/in.h>
 #include <signal.h>
+#include <sys/prctl.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <chrono>
 #include <string>
+#include <thread>
 
 #include "platform/local_account.h"
 #include "platform/process.h"
 #include "support/appliance.h"
+#include "support/faults.h"
 
 using namespace quendel::test;
 
@@ -162,6 +166,28 @@ TEST(APIRunnerTest, StopsNoProcessThatIsNoSshd) {
   }
   EXPECT_EQ(kill(other, 0), 0);
   kill(other, SIGKILL);
+}
+
+TEST(APIRunnerTest, TakesAServiceThatEndsByItselfForStopped) {
+  signal(SIGCHLD, SIG_IGN);    // nothing stays of a child that has ended
+  prctl(PR_SET_NAME, "sshd");  // which a child inherits
+  const pid_t sshd = fork();
+  if (sshd == 0) {
+    std::this_thread::sleep_for(std::chrono::milliseconds(200));
+    _exit(0);
+  }
+  prctl(PR_SET_NAME, "test");
+  WriteFile(kPidFile, std::to_string(sshd) + "\n");
+  FailCall("platform:kill", 1, -1, ESRCH);
+  EXPECT_EQ(CodeOf(Call(EnableSsh(false))), 0);
+  EXPECT_EQ(Calls("platform:kill"), 1);
+}
+
+TEST(APIRunnerTest, FailsWhenTheServiceCannotBeStopped) {
+  prctl(PR_SET_NAME, "sshd");
+  WriteFile(kPidFile, std::to_string(getpid()) + "\n");
+  FailCall("platform:kill", 1, -1, EPERM);
+  EXPECT_EQ(CodeOf(Call(EnableSsh(false))), 500);
 }
 
 TEST(APIRunnerTest, StartsAndStopsTheService) {

@@ -81,7 +81,8 @@ bool StopSshService() {
   if (process == 0) {
     return true;
   }
-  return kill(process, SIGTERM) == 0 && WaitUntilRunning(false);
+  // It may have ended by itself meanwhile.
+  return (kill(process, SIGTERM) == 0 || errno == ESRCH) && WaitUntilRunning(false);
 }
 
 }  // namespace platform
