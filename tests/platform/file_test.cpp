@@ -11,6 +11,7 @@
 #include <vector>
 
 #include "containers.h"
+#include "failing_call.h"
 #include "platform/error.h"
 #include "platform/owned.h"
 #include "support/appliance.h"
@@ -18,6 +19,12 @@
 using namespace quendel::test;
 using testing::ElementsAre;
 using testing::IsEmpty;
+
+QUENDEL_FAILING_CALL(int, mkdirat, (int directory, const char* name, mode_t mode), directory, name,
+                     mode)
+QUENDEL_FAILING_CALL(int, utimensat,
+                     (int directory, const char* name, const timespec* times, int flags), directory,
+                     name, times, flags)
 
 namespace {
 
@@ -130,6 +137,13 @@ TEST(FileTouchTest, SetsTheTimesOfWhatIsThere) {
   EXPECT_EQ(ALIBCFileTouch("/tmp/file"), 0);
   EXPECT_EQ(ReadFile("/tmp/file"), "kept");
   EXPECT_GT(StatusOf("/tmp/file").st_mtime, 1000);
+}
+
+TEST(FileTouchTest, TakesAFileThatSomebodyElseCreatesMeanwhile) {
+  WriteFile("/tmp/file", "kept");
+  utimensatCalls.Fail(1, -1, ENOENT);  // as long as it was not there
+  EXPECT_EQ(ALIBCFileTouch("/tmp/file"), 0);
+  EXPECT_EQ(ReadFile("/tmp/file"), "kept");
 }
 
 TEST(FileTouchTest, DoesNotWaitForAFifo) {
@@ -281,6 +295,13 @@ TEST(FSMkdirPTest, FollowsALinkToADirectory) {
   symlink("/run", "/tmp/link");
   EXPECT_EQ(MakePath("/tmp/link/a", 0700), 0);
   EXPECT_EQ(ALIBCFileCheckDir("/run/a"), 1);
+}
+
+TEST(FSMkdirPTest, TakesADirectoryThatSomebodyElseMakesMeanwhile) {
+  mkdiratCalls.BeforeNext([] { mkdir("/tmp/a", 0750); });
+  EXPECT_EQ(MakePath("/tmp/a/b", 0700), 0);
+  EXPECT_EQ(ModeOf("/tmp/a"), 0750U);
+  EXPECT_EQ(ModeOf("/tmp/a/b"), 0700U);
 }
 
 TEST(FSMkdirPTest, FailsWhereAFileIsInTheWay) {
