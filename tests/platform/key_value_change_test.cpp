@@ -491,6 +491,20 @@ TEST(FileSetKeyValueTest, WaitsForAnotherWriter) {
   EXPECT_EQ(Get("key"), "new");
 }
 
+TEST(FileSetKeyValueTest, ReleasesALockThatAChildHasInherited) {
+  WriteFile(kPath, "key=old\n");
+  int lock = -1;
+  pid_t child = -1;
+  fsyncCalls.BeforeNext([&] {
+    lock = open("/tmp/settings/.test.conf.lock", O_RDWR | O_CLOEXEC);
+    child = InChild([] { pause(); });
+  });
+  EXPECT_EQ(Set("key", "new"), 1);
+  EXPECT_EQ(flock(lock, LOCK_EX | LOCK_NB), 0);
+  kill(child, SIGKILL);
+  StatusOf(child);
+}
+
 TEST(FileSetKeyValueTest, IsNotDisturbedBySignals) {
   WriteFile(kPath, "key=old\n");
   struct sigaction action = {};
