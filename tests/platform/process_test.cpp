@@ -15,6 +15,7 @@
 
 #include "platform/error.h"
 #include "support/appliance.h"
+#include "support/faults.h"
 
 using namespace quendel::test;
 using testing::HasSubstr;
@@ -411,4 +412,11 @@ TEST(ProcForkExTest, ForksLikeFork) {
   int status = 0;
   EXPECT_EQ(waitpid(child, &status, 0), child);
   EXPECT_EQ(WEXITSTATUS(status), 12);
+}
+
+TEST(ProcForkExTest, FailsLikeFork) {
+  FailCall("platform:fork", 1, -1, EAGAIN);
+  EXPECT_LT(ALIBCProcForkEx(187), 0);
+  EXPECT_EQ(ALIBCErrGet(), 0x0800);
+  EXPECT_EQ(errno, EAGAIN);
 }
