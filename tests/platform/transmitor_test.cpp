@@ -47,7 +47,7 @@ Json::Value Named(const Json::Value& list, const std::string& name) {
   return Json::Value();
 }
 
-// Expects that an object has exactly these members and that each is a number.
+// Expects that an object has at least these members and that each is a number.
 void ExpectNumbers(const Json::Value& object, const std::vector<std::string>& names) {
   for (const std::string& name : names) {
     EXPECT_TRUE(object.isMember(name) && object[name].isNumeric()) << name;
