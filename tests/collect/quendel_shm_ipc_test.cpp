@@ -108,8 +108,11 @@ void AtSecond(int second, const std::function<void()>& action) {
 
 TEST(ShmAllocTest, MakesASegmentForEverybody) {
   Record("shmget");
+  Record("shmat");
   EXPECT_EQ(QUENDELShmAlloc(kSize, kKey), 0);
-  EXPECT_THAT(Recorded(), ElementsAre("81|10000|950"));
+  const std::vector<std::string> recorded = Recorded();
+  const std::string id = std::to_string(shmget(kKey, 0, 0));
+  EXPECT_THAT(recorded, ElementsAre("81|10000|950", id + "|0"));
   EXPECT_EQ(Segment().shm_perm.mode & 0777U, 0666U);
   EXPECT_EQ(Segment().shm_segsz, kSize);
   EXPECT_EQ(FirstByte(), '\0');
@@ -386,6 +389,18 @@ TEST(ShmReceiveTest, TriesUntilTheSegmentIsRemoved) {
                                  "Failed to mark the segment to be destroyed, errno: "
                                  "Operation not permitted")));
   EXPECT_FALSE(SegmentExists());
+}
+
+TEST(ShmReceiveTest, MarksTheSegmentBeforeItLetsGo) {
+  ASSERT_EQ(QUENDELShmAlloc(kSize, kKey), 0);
+  ASSERT_EQ(Send(Block('*')), 0);
+  const std::string id = std::to_string(shmget(kKey, 0, 0));
+  ResetCalls();
+  Record("shmctl");
+  Record("shmdt");
+  std::string block(kSize, '#');
+  EXPECT_EQ(Receive(block), 0);
+  EXPECT_THAT(Recorded(), ElementsAre(id + "|0", ""));  // an address is not recorded
 }
 
 TEST(ShmReceiveTest, LetsGoOfTheSegment) {
