@@ -166,6 +166,7 @@ TEST(SendUploadDataTest, FailsWhenThePostDoesNotGetThrough) {
 }
 
 TEST(SendUploadDataTest, GoesByWhatEachHostileReplySays) {
+  EXPECT_THAT(Requests(), SizeIs(1));  // nothing is retried
   SetIdentity();
   for (const HostileReply& reply : HostileReplies()) {
     SCOPED_TRACE(reply.name);
@@ -174,6 +175,7 @@ TEST(SendUploadDataTest, GoesByWhatEachHostileReplySays) {
     EXPECT_EQ(QUENDELSendUploadData(17, {}), reply.success ? 0 : -1);
     if (reply.success) {
       EXPECT_THAT(Log(), IsEmpty());
+  EXPECT_EQ(Calls("curl_easy_perform"), 1);  // nothing is retried
     } else {
       EXPECT_THAT(Log().back(), Logged(kUnit, "Failed to post file to server"));
     }
