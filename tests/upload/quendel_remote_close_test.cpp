@@ -115,6 +115,25 @@ TEST(RemoteCloseTest, ClosesASessionWhole) {
   EXPECT_THAT(Log(), IsEmpty());
 }
 
+TEST(RemoteCloseTest, TakesAFileWithoutSettings) {
+  SetIdentity();
+  for (const char* text : {"", "# none\n"}) {
+    WriteFile(kConf, text);
+    EXPECT_EQ(QUENDELRemoteClose(17, QUENDEL_ACT_PROGRESS_DONE), 0);
+    EXPECT_FALSE(Exists(kConf));
+  }
+  EXPECT_THAT(RequestLines(), SizeIs(2));
+  EXPECT_THAT(Log(), IsEmpty());
+}
+
+TEST(RemoteCloseTest, ReadsTheFileIntoAHashFor1024Pairs) {
+  SetIdentity();
+  WriteFile(kConf, "other=1\n");
+  Record("ALIBCSzHashAlloc");
+  EXPECT_EQ(QUENDELRemoteClose(17, QUENDEL_ACT_PROGRESS_DONE), 0);
+  EXPECT_THAT(Recorded(), ElementsAre("1024"));
+}
+
 TEST(RemoteCloseTest, FailsWithoutMemoryForTheSettings) {
   WriteFile(kConf, "remote_account=\"support\"\n");
   FailCall("ALIBCSzHashAlloc", 1, 0);
@@ -204,3 +223,18 @@ TEST(RemoteCloseTest, CanBeRepeatedAfterAFailure) {
   EXPECT_THAT(Log(), IsEmpty());
   EXPECT_FALSE(Exists(kConf));
 }
+TEST(RemoteCloseTest, StopsSshdBeforeItRemovesTheFile) {
+  SetIdentity();
+  WriteFile(kConf, "stop_sshd_after_complete=\"yes\"\n");
+  const auto notRemoved = Logged(kUnit, "Failed to rm dir '/usr/arvo/etc/quendel.remote.conf'");
+  FailCall("ALIBCExec", 1, -1);
+  EXPECT_EQ(QUENDELRemoteClose(17, QUENDEL_ACT_PROGRESS_DONE), -1);
+  EXPECT_THAT(ApiCalls(), SizeIs(1));
+  EXPECT_THAT(Log(), ElementsAre(notRemoved));
+  ClearLog();
+  ApiAnswers().push_back(JsonOf(R"({"success":false})"));
+  FailCall("ALIBCExec", 1, -1);
+  EXPECT_EQ(QUENDELRemoteClose(17, QUENDEL_ACT_PROGRESS_DONE), -1);
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to stop ssh service"), notRemoved));
+}
+
