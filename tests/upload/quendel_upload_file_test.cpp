@@ -648,6 +648,17 @@ TEST_F(UploadFileTest, SendsAllFilesInOnePostInTheirOrder) {
 
 TEST_F(UploadFileTest, OneFailedFileDoesNotStopTheOthers) {
   EXPECT_EQ(Upload(List({File("coredump", "/var/crash/@gone.core"), File("core", kDump),
+// As with a zip that does not know the options.
+TEST_F(UploadFileTest, FailsTheWholePostWithoutTheArchive) {
+  Tool("/usr/bin/zip", "exit 16");
+  EXPECT_EQ(Upload(List({File("coredump", kDump), File("debug.dat", "")})), -1);
+  EXPECT_THAT(Log(),
+              ElementsAre(Logged("quendel_post_file_to_server", HasSubstr("CURL Error(26): ")),
+                          Logged("quendel_send_upload_data", "Failed to post file to server"),
+                          Logged(kUnit, "Send collect data fail")));
+  EXPECT_THAT(Requests(), IsEmpty());
+}
+
                          File("coredump", kDump, "found")})),
             0);
   EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Fail to compress coredump"),
