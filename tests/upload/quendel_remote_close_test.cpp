@@ -149,6 +149,19 @@ TEST(RemoteCloseTest, FailsWithoutASession) {
   EXPECT_THAT(Requests(), IsEmpty());
 }
 
+TEST(RemoteCloseTest, FailsWhenTheFileCannotBeRead) {
+  SetIdentity();
+  WriteFile(kConf, "other=1\n");
+  for (const long result : {-1L, -2L}) {
+    ClearLog();
+    FailCall("ALIBCFileGetPair", 1, result);
+    EXPECT_EQ(QUENDELRemoteClose(17, QUENDEL_ACT_PROGRESS_DONE), -1) << result;
+    EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to get quendel key configuration file")));
+  }
+  EXPECT_THAT(Requests(), IsEmpty());
+  EXPECT_TRUE(Exists(kConf));
+}
+
 TEST(RemoteCloseTest, FailsWhenTheAccountCannotBeDeleted) {
   SetIdentity();
   WriteFile(kConf, "stop_sshd_after_complete=\"yes\"\nremote_account=\"support\"\n");
@@ -212,17 +225,6 @@ TEST(RemoteCloseTest, FailsWhenTheFileCannotBeRemoved) {
               ElementsAre(Logged(kUnit, "Failed to rm dir '/usr/arvo/etc/quendel.remote.conf'")));
 }
 
-TEST(RemoteCloseTest, CanBeRepeatedAfterAFailure) {
-  SetIdentity();
-  ASSERT_EQ(QUENDELSupportAccountUserCreate("support", "key"), 0);
-  WriteFile(kConf, "remote_account=\"support\"\n");
-  Answer({.status = 500});
-  EXPECT_EQ(QUENDELRemoteClose(17, QUENDEL_ACT_PROGRESS_DONE), -1);
-  ClearLog();
-  EXPECT_EQ(QUENDELRemoteClose(17, QUENDEL_ACT_PROGRESS_DONE), 0);
-  EXPECT_THAT(Log(), IsEmpty());
-  EXPECT_FALSE(Exists(kConf));
-}
 TEST(RemoteCloseTest, StopsSshdBeforeItRemovesTheFile) {
   SetIdentity();
   WriteFile(kConf, "stop_sshd_after_complete=\"yes\"\n");
@@ -238,3 +240,14 @@ TEST(RemoteCloseTest, StopsSshdBeforeItRemovesTheFile) {
   EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to stop ssh service"), notRemoved));
 }
 
+TEST(RemoteCloseTest, CanBeRepeatedAfterAFailure) {
+  SetIdentity();
+  ASSERT_EQ(QUENDELSupportAccountUserCreate("support", "key"), 0);
+  WriteFile(kConf, "remote_account=\"support\"\n");
+  Answer({.status = 500});
+  EXPECT_EQ(QUENDELRemoteClose(17, QUENDEL_ACT_PROGRESS_DONE), -1);
+  ClearLog();
+  EXPECT_EQ(QUENDELRemoteClose(17, QUENDEL_ACT_PROGRESS_DONE), 0);
+  EXPECT_THAT(Log(), IsEmpty());
+  EXPECT_FALSE(Exists(kConf));
+}

@@ -147,6 +147,17 @@ TEST(SendUploadDataTest, FailsWithoutASerialNumber) {
   EXPECT_THAT(Requests(), IsEmpty());
 }
 
+TEST(SendUploadDataTest, FailsOnAnyNegativeResult) {
+  SetIdentity();
+  FailCall("ARVOMYHUBAccountGet", 1, -2);
+  EXPECT_EQ(QUENDELSendUploadData(17, {}), -1);
+  FailCall("ALIBGetSerialNumber", 1, -2);
+  EXPECT_EQ(QUENDELSendUploadData(17, {}), -1);
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to get account"),
+                                 Logged(kUnit, "Failed to get serial number")));
+  EXPECT_THAT(Requests(), IsEmpty());
+}
+
 TEST(SendUploadDataTest, FailsWhenTheServerRefuses) {
   SetIdentity();
   Answer({.body = R"({"success":false,"code":111001})"});
@@ -155,6 +166,7 @@ TEST(SendUploadDataTest, FailsWhenTheServerRefuses) {
                                  Logged("quendel_post_file_to_server",
                                         HasSubstr("Failed to handle response")),
                                  Logged(kUnit, "Failed to post file to server")));
+  EXPECT_THAT(Requests(), SizeIs(1));  // nothing is retried
 }
 
 TEST(SendUploadDataTest, FailsWhenThePostDoesNotGetThrough) {
@@ -163,10 +175,10 @@ TEST(SendUploadDataTest, FailsWhenThePostDoesNotGetThrough) {
   EXPECT_EQ(QUENDELSendUploadData(17, {}), -1);
   EXPECT_THAT(Log(), ElementsAre(Logged("quendel_post_file_to_server", _),
                                  Logged(kUnit, "Failed to post file to server")));
+  EXPECT_EQ(Calls("curl_easy_perform"), 1);  // nothing is retried
 }
 
 TEST(SendUploadDataTest, GoesByWhatEachHostileReplySays) {
-  EXPECT_THAT(Requests(), SizeIs(1));  // nothing is retried
   SetIdentity();
   for (const HostileReply& reply : HostileReplies()) {
     SCOPED_TRACE(reply.name);
@@ -175,7 +187,6 @@ TEST(SendUploadDataTest, GoesByWhatEachHostileReplySays) {
     EXPECT_EQ(QUENDELSendUploadData(17, {}), reply.success ? 0 : -1);
     if (reply.success) {
       EXPECT_THAT(Log(), IsEmpty());
-  EXPECT_EQ(Calls("curl_easy_perform"), 1);  // nothing is retried
     } else {
       EXPECT_THAT(Log().back(), Logged(kUnit, "Failed to post file to server"));
     }

@@ -141,10 +141,20 @@ TEST(SupportAccountUserCreateTest, FailsWhenMkdirRanButMadeNothing) {
 }
 
 TEST(SupportAccountUserCreateTest, FailsWhenTheAccountCannotBePrepared) {
-  FailCall("ARVOLocalAccountUserPrepareForQuendel", 1, -1);
-  EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), -1);
-  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to prepare local account 'support'")));
-  EXPECT_FALSE(Exists(kKeyFile));
+  for (const long result : {-1L, -2L}) {
+    ClearLog();
+    FailCall("ARVOLocalAccountUserPrepareForQuendel", 1, result);
+    EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), -1) << result;
+    EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to prepare local account 'support'")));
+    EXPECT_FALSE(Exists(kKeyFile));
+  }
+}
+
+TEST(SupportAccountUserCreateTest, TakesAnyResultButANegativeOneForPrepared) {
+  FailCall("ARVOLocalAccountUserPrepareForQuendel", 1, 1);
+  EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), 0);
+  EXPECT_EQ(ReadFile(kKeyFile), kKey);
+  EXPECT_THAT(Log(), IsEmpty());
 }
 
 TEST(SupportAccountUserCreateTest, FailsWhenTheKeyFileCannotBeOpened) {
@@ -262,6 +272,25 @@ TEST(SupportAccountUserDeleteTest, LeavesAHomeThatItCannotTellToBeOne) {
 TEST(SupportAccountUserDeleteTest, AccountThatIsGoneCountsAsDeleted) {
   EXPECT_EQ(QUENDELSupportAccountUserDelete("nobody-there"), 0);
   EXPECT_EQ(Calls("ALIBCMResultCoreErrorsGet"), 1);
+  EXPECT_THAT(Log(), IsEmpty());
+}
+
+TEST(SupportAccountUserDeleteTest, AsksForTheErrorCodesAfterAnyNegativeResult) {
+  for (const long result : {-1L, -2L}) {
+    ResetCalls();
+    FailCall("ARVOLocalAccountUserDelete", 1, result);
+    EXPECT_EQ(QUENDELSupportAccountUserDelete("support"), -1) << result;
+    EXPECT_EQ(Calls("ALIBCMResultCoreErrorsGet"), 1);
+  }
+}
+
+TEST(SupportAccountUserDeleteTest, TakesAnyOtherResultForDeleted) {
+  for (const long result : {0L, 1L}) {
+    ResetCalls();
+    FailCall("ARVOLocalAccountUserDelete", 1, result);
+    EXPECT_EQ(QUENDELSupportAccountUserDelete("support"), 0) << result;
+    EXPECT_EQ(Calls("ALIBCMResultCoreErrorsGet"), 0);
+  }
   EXPECT_THAT(Log(), IsEmpty());
 }
 

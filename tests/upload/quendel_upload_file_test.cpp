@@ -495,12 +495,25 @@ TEST_F(UploadFileTest, TakesTheTimeOfEachFile) {
 }
 
 TEST_F(UploadFileTest, GivesADumpUpWithoutItsDirectory) {
-  FailCall("ARVOFSMkdirP", 1, -1);
-  EXPECT_EQ(Upload(List({File("coredump", kDump)})), 0);
-  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Fail to ARVOFSMkdirP for '/tmp/quendel/coredump'"),
-                                 GivenUp("coredump", kDump)));
-  EXPECT_THAT(Recorded(), IsEmpty());
-  EXPECT_THAT(RequestLines(), ElementsAre(kNoFile));
+  for (const long result : {-1L, -2L}) {
+    StartOver();
+    FailCall("ARVOFSMkdirP", 1, result);
+    EXPECT_EQ(Upload(List({File("coredump", kDump)})), 0);
+    EXPECT_THAT(Log(),
+                ElementsAre(Logged(kUnit, "Fail to ARVOFSMkdirP for '/tmp/quendel/coredump'"),
+                            GivenUp("coredump", kDump)));
+    EXPECT_THAT(Recorded(), IsEmpty());
+  }
+  EXPECT_THAT(RequestLines(), ElementsAre(kNoFile, kNoFile));
+}
+
+TEST_F(UploadFileTest, TakesAnyResultButANegativeOneForADirectory) {
+  WriteFile("/tmp/quendel/coredump/file", "");
+  WriteFile("/tmp/quendel/debugdat/file", "");
+  FailCall("ARVOFSMkdirP", 0, 1);
+  EXPECT_EQ(Upload(List({File("coredump", kDump), File("debug.dat", "")})), 0);
+  EXPECT_THAT(Log(), IsEmpty());
+  EXPECT_THAT(RequestLines(), ElementsAre(kUpload));
 }
 
 TEST_F(UploadFileTest, GivesADumpUpThatCannotBeCompressed) {
@@ -540,11 +553,14 @@ TEST_F(UploadFileTest, TellsOfACopyThatCannotBeTakenAway) {
 }
 
 TEST_F(UploadFileTest, LooksOnlyWhetherTheRemovalOfACopyCouldRun) {
-  FailCall("ALIBCExec", 2, 1);
-  FailCall("ALIBCExecl", 1, 1);
-  EXPECT_EQ(Upload(List({File("coredump", kDump)})), 0);
-  EXPECT_THAT(Log(),
-              ElementsAre(Logged(kUnit, "Fail to move coredump"), GivenUp("coredump", kDump)));
+  for (const long result : {1L, -2L}) {
+    StartOver();
+    FailCall("ALIBCExec", 2, 1);
+    FailCall("ALIBCExecl", 1, result);
+    EXPECT_EQ(Upload(List({File("coredump", kDump)})), 0);
+    EXPECT_THAT(Log(),
+                ElementsAre(Logged(kUnit, "Fail to move coredump"), GivenUp("coredump", kDump)));
+  }
 }
 
 // With its ".xz" a path of 1,020 bytes is the longest that the buffer of 1,024 holds whole.
@@ -612,12 +628,16 @@ TEST_F(UploadFileTest, GivesTheDebugArchiveUpWhenNothingCouldBeCollected) {
 }
 
 TEST_F(UploadFileTest, GivesTheDebugArchiveUpThatCouldNotBePacked) {
-  FailCall("ALIBCExecl", 1, -1);
-  EXPECT_EQ(Upload(List({File("debug.dat", "p")})), 0);
-  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Fail to zip attachment /tmp/quendel/debugdat.zip"),
-                                 GivenUp("debug.dat", "p")));
-  EXPECT_THAT(Recorded(), ElementsAre(kCollector, kZip, kRemoveDebug));
-  EXPECT_FALSE(Exists("/tmp/quendel/debugdat"));
+  for (const long result : {-1L, -2L}) {
+    StartOver();
+    FailCall("ALIBCExecl", 1, result);
+    EXPECT_EQ(Upload(List({File("debug.dat", "p")})), 0);
+    EXPECT_THAT(Log(),
+                ElementsAre(Logged(kUnit, "Fail to zip attachment /tmp/quendel/debugdat.zip"),
+                            GivenUp("debug.dat", "p")));
+    EXPECT_THAT(Recorded(), ElementsAre(kCollector, kZip, kRemoveDebug));
+    EXPECT_FALSE(Exists("/tmp/quendel/debugdat"));
+  }
 }
 
 TEST_F(UploadFileTest, LooksOnlyWhetherThePackingCouldRun) {
@@ -626,6 +646,17 @@ TEST_F(UploadFileTest, LooksOnlyWhetherThePackingCouldRun) {
   EXPECT_THAT(Log(), IsEmpty());
   ASSERT_THAT(RequestLines(), ElementsAre(kUpload));
   EXPECT_THAT(Requests()[0].body, HasSubstr("half"));
+}
+
+// As with a zip that does not know the options.
+TEST_F(UploadFileTest, FailsTheWholePostWithoutTheArchive) {
+  Tool("/usr/bin/zip", "exit 16");
+  EXPECT_EQ(Upload(List({File("coredump", kDump), File("debug.dat", "")})), -1);
+  EXPECT_THAT(Log(),
+              ElementsAre(Logged("quendel_post_file_to_server", HasSubstr("CURL Error(26): ")),
+                          Logged("quendel_send_upload_data", "Failed to post file to server"),
+                          Logged(kUnit, "Send collect data fail")));
+  EXPECT_THAT(Requests(), IsEmpty());
 }
 
 // ---- Several files.
@@ -648,17 +679,6 @@ TEST_F(UploadFileTest, SendsAllFilesInOnePostInTheirOrder) {
 
 TEST_F(UploadFileTest, OneFailedFileDoesNotStopTheOthers) {
   EXPECT_EQ(Upload(List({File("coredump", "/var/crash/@gone.core"), File("core", kDump),
-// As with a zip that does not know the options.
-TEST_F(UploadFileTest, FailsTheWholePostWithoutTheArchive) {
-  Tool("/usr/bin/zip", "exit 16");
-  EXPECT_EQ(Upload(List({File("coredump", kDump), File("debug.dat", "")})), -1);
-  EXPECT_THAT(Log(),
-              ElementsAre(Logged("quendel_post_file_to_server", HasSubstr("CURL Error(26): ")),
-                          Logged("quendel_send_upload_data", "Failed to post file to server"),
-                          Logged(kUnit, "Send collect data fail")));
-  EXPECT_THAT(Requests(), IsEmpty());
-}
-
                          File("coredump", kDump, "found")})),
             0);
   EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Fail to compress coredump"),
@@ -714,9 +734,12 @@ TEST_F(UploadFileTest, TellsOfADirectoryThatCannotBeRemoved) {
 }
 
 TEST_F(UploadFileTest, LooksOnlyWhetherTheRemovalCouldRun) {
-  FailCall("ALIBCExecl", 1, 1);
-  EXPECT_EQ(Upload(List({File("coredump", kDump)})), 0);
-  EXPECT_THAT(Log(), IsEmpty());
+  for (const long result : {1L, -2L}) {
+    StartOver();
+    FailCall("ALIBCExecl", 1, result);
+    EXPECT_EQ(Upload(List({File("coredump", kDump)})), 0);
+    EXPECT_THAT(Log(), IsEmpty());
+  }
 }
 
 TEST_F(UploadFileTest, RemovalThatFailsDoesNotChangeTheResult) {
