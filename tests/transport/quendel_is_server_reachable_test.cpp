@@ -1,6 +1,7 @@
 // The connect test: pairs of successes within six attempts.
 #include <dirent.h>
 #include <gmock/gmock.h>
+#include <netdb.h>
 #include <sys/socket.h>
 
 #include <cerrno>
@@ -123,6 +124,26 @@ TEST(IsServerReachableTest, GivesUpAtOnceOnAHostThatIsNotKnown) {
                          kUnit, "Failed to get IP address of target hostname: no.such.host")));
   EXPECT_EQ(Calls("socket"), 0);
   EXPECT_EQ(SleptSeconds(), 0);
+}
+
+TEST(IsServerReachableTest, GivesUpAtOnceOnAHostWithoutAnAddressOfItsKind) {
+  char bytes[16] = {127, 0, 0, 1};
+  char* addresses[] = {bytes, nullptr};
+  char* none[] = {nullptr};
+  hostent ofAnotherKind = {};
+  ofAnotherKind.h_addrtype = AF_INET6;
+  ofAnotherKind.h_addr_list = addresses;
+  hostent withoutAny = {};
+  withoutAny.h_addrtype = AF_INET;
+  withoutAny.h_addr_list = none;
+  for (hostent* host : {&ofAnotherKind, &withoutAny}) {
+    ClearLog();
+    FailCall("gethostbyname", 1, reinterpret_cast<long>(host));
+    EXPECT_EQ(QUENDELIsServerReachable(), 0);
+    EXPECT_THAT(Log(), ElementsAre(Logged(
+                           kUnit, "Failed to get IP address of target hostname: support.test")));
+    EXPECT_EQ(Calls("socket"), 0);
+  }
 }
 
 TEST(IsServerReachableTest, TriesOnlyTheFirstAddress) {

@@ -48,9 +48,11 @@ int Describe(Json::Value& info, const QUENDELSendDataParam_t& item) {
   return 0;
 }
 
+int result_for_b = -1;
+
 int DescribeAllButB(Json::Value& info, const QUENDELSendDataParam_t& item) {
   info["path"] = item.path;
-  return item.path == "/tmp/b.txt" ? -1 : 0;
+  return item.path == "/tmp/b.txt" ? result_for_b : 0;
 }
 
 int ThrowForB(Json::Value& info, const QUENDELSendDataParam_t& item) {
@@ -165,6 +167,16 @@ TEST(PostFileToServerTest, KeepsAFileThatCannotBeDescribed) {
   EXPECT_EQ(parts[1], FilePart("file", "b.txt", "text/plain", "b"));
   EXPECT_THAT(DescribedPaths(), ElementsAre("/tmp/a.txt", "/tmp/c.txt"));
   EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to gen file metadata: '/tmp/b.txt'")));
+}
+
+TEST(PostFileToServerTest, TakesAnyResultButZeroForAFailedDescription) {
+  for (const int result : {-2, -1, 1}) {
+    result_for_b = result;
+    EXPECT_EQ(QUENDELPostFileToServer(kUrl, "file", NewFile("/tmp/b.txt", "b"), DescribeAllButB),
+              0);
+    EXPECT_EQ(JsonOf(Parts(Requests().back()).back().body), Json::Value(Json::arrayValue))
+        << result;
+  }
 }
 
 TEST(PostFileToServerTest, TakesAThrownExceptionForAFailedDescription) {
