@@ -163,6 +163,15 @@ TEST_F(RemoteCreateCommandTest, TakesTheSupportAccountThatIsLeftOver) {
   EXPECT_TRUE(Exists(kConf));
 }
 
+TEST_F(RemoteCreateCommandTest, OpensASessionWithoutWhatAnEarlierHolderLeft) {
+  const std::string folder = "/run/quendelhome/.ssh";
+  WriteFile(folder + "/authorized_keys/a-folder-in-its-place", "");
+  WriteFile(folder + "/authorized_keys2", "an earlier holder's key");
+  EXPECT_EQ(Quendelctl({"remote", "create", "support", kKeyFile}).status, 0);
+  EXPECT_EQ(ReadFile(folder + "/authorized_keys"), ReadFile(kKeyFile));
+  EXPECT_FALSE(Exists(folder + "/authorized_keys2"));
+}
+
 // The list of accounts is too long to be written here, the session's file is not.
 TEST_F(RemoteCreateCommandTest, SaysWhenTheSessionHasToBeEnded) {
   ASSERT_EQ(Shell("/usr/sbin/useradd --uid 50001 --no-user-group --gid 100 support").status, 0);
@@ -178,11 +187,12 @@ TEST_F(RemoteCreateCommandTest, SaysWhenTheSessionHasToBeEnded) {
 }
 
 TEST_F(RemoteCreateCommandTest, ClearsAwayWhatCouldNotBeMadeWhole) {
-  WriteFile("/run/quendelhome/.ssh/authorized_keys/inside", "");  // a folder in the file's place
-  const Output output = Quendelctl({"remote", "create", "support", kKeyFile});
+  WriteFile("/tmp/long.pub", std::string(200'000, 'k'));  // longer than a file may be below
+  const Output output =
+      Shell("trap '' XFSZ; ulimit -f 200; $quendelctl remote create support /tmp/long.pub");
   EXPECT_EQ(output.status, 1);
   EXPECT_EQ(output.out, kNotOpened);
-  EXPECT_THAT(output.err, HasSubstr("Failed to open '/run/quendelhome/.ssh/authorized_keys'"));
+  EXPECT_THAT(output.err, HasSubstr("Failed to update '/run/quendelhome/.ssh/authorized_keys'"));
   EXPECT_FALSE(AccountExists("support"));
   EXPECT_FALSE(Exists("/run/quendelhome"));
   EXPECT_FALSE(Exists(kConf));

@@ -58,6 +58,12 @@ std::vector<std::string> ClearAway(const std::string& user) {
   return {"The remote session is open in part only: end it with \"quendelctl remote close\"."};
 }
 
+// An earlier holder of the account may have left keys of their own in its home, or still be there.
+bool MakeAccountAfresh(const std::string& user, const std::string& key) {
+  return QUENDELSupportAccountUserDelete(user.c_str()) == 0 &&
+         QUENDELSupportAccountUserCreate(user.c_str(), key.c_str()) == 0;
+}
+
 // The file comes first: whatever happens after it, the session can be ended.
 Result OpenSession(const std::string& user, const std::string& key, bool stopSshd) {
   Result result;
@@ -75,7 +81,7 @@ Result OpenSession(const std::string& user, const std::string& key, bool stopSsh
   if (file != SessionFile::kWritten) {
     return result;
   }
-  if (QUENDELSupportAccountUserCreate(user.c_str(), key.c_str()) != 0) {
+  if (!MakeAccountAfresh(user, key)) {
     result.lines = ClearAway(user);
     return result;
   }
