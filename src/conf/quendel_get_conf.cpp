@@ -6,6 +6,7 @@
 #include "base/json_text.h"
 #include "base/log.h"
 #include "base/paths.h"
+#include "conf/hash_value.h"
 #include "platform/device.h"
 #include "platform/file.h"
 #include "platform/key_value.h"
@@ -26,12 +27,6 @@ Json::Value ContactFromText(const std::string& text) {
     return contact;
   }
   return Json::arrayValue;
-}
-
-// Returns a copy of the value, or an empty text when the hash does not have the key.
-std::string HashValue(ALIBSZHASH* hash, const char* key) {
-  const char* value = ALIBCSzHashGetValue(hash, key);
-  return value == nullptr ? std::string() : std::string(value);
 }
 
 }  // namespace

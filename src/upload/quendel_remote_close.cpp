@@ -4,8 +4,8 @@
 #include "base/json_text.h"
 #include "base/log.h"
 #include "base/paths.h"
+#include "conf/hash_value.h"
 #include "platform/api_runner.h"
-#include "platform/hash.h"
 #include "platform/key_value.h"
 #include "platform/owned.h"
 #include "quendel/conf.h"
@@ -31,11 +31,6 @@ bool IsClosing(QuendelActionProgress_t progress) {
 }
 
 // Without memory for the name of an account, the account must not pass for one that is not there.
-std::string ValueOrThrow(ALIBSZHASH* hash, const char* key) {
-  const char* value = ALIBCSzHashGetValue(hash, key);
-  return value == nullptr ? "" : value;
-}
-
 bool ReadSession(Session& session) try {
   platform::OwnedHash hash(kHashPairs);
   if (!hash) {
@@ -46,8 +41,8 @@ bool ReadSession(Session& session) try {
     QUENDEL_LOG("Failed to get quendel key configuration file");
     return false;
   }
-  session.stop_sshd = ValueOrThrow(hash.get(), "stop_sshd_after_complete") == "yes";
-  session.account = ValueOrThrow(hash.get(), "remote_account");
+  session.stop_sshd = HashValue(hash.get(), "stop_sshd_after_complete") == "yes";
+  session.account = HashValue(hash.get(), "remote_account");
   return true;
 } catch (...) {
   QUENDEL_LOG("Fail to allocate memory for alibc hash");
