@@ -32,6 +32,9 @@ struct Command {
   Action (*declare)(CLI::App& command);
 };
 
+// Adds a command below another one, or below the program, without its arguments.
+CLI::App* AddCommand(CLI::App& parent, const Command& command);
+
 // Declares the commands of a group, which does nothing itself. Returns what runs the one that was
 // given.
 Action DeclareGroup(CLI::App& group, const std::vector<Command>& commands);

@@ -57,8 +57,7 @@ std::vector<CLI::App*> Doers(CLI::App& command) {
 }
 
 void DeclareCommand(CLI::App& app, const Command& command, Request& request) {
-  CLI::App* subcommand = app.add_subcommand(command.name, command.summary);
-  subcommand->group("Commands")->footer(command.examples);
+  CLI::App* subcommand = AddCommand(app, command);
   Action action = command.declare(*subcommand);
   for (CLI::App* doer : Doers(*subcommand)) {
     doer->add_flag("--json", request.json, "Print one line of JSON instead of text");
