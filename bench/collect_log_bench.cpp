@@ -181,15 +181,24 @@ void MemoryOfWholeCopy(benchmark::State& state) {
   Memory(state, true);
 }
 
+std::string LogNumber(int64_t number) {
+  return "/volume1/logs/" + std::to_string(number);
+}
+
+// Lets the collectors forget what they know of so many logs.
+void ForgetLogs(int64_t count) {
+  for (int64_t i = 0; i < count; ++i) {
+    InstallLog(std::to_string(i), LogNumber(i));
+  }
+}
+
 void InstallLogs(int64_t count) {
   ResetFolders();
   MakeEmptyFolder("/volume1/logs");
   for (int64_t i = 0; i < count; ++i) {
-    const std::string name = std::to_string(i);
-    const std::string log = "/volume1/logs/" + name;
-    WriteText(log, kTwoLines);
-    InstallLog(name, log);
+    WriteText(LogNumber(i), kTwoLines);
   }
+  ForgetLogs(count);
 }
 
 void RequireCommitted(const std::string& name) {
@@ -221,9 +230,7 @@ void CommitAll(benchmark::State& state) {
     Commit();
     state.PauseTiming();
     RequireCommitted("0");
-    for (int64_t i = 0; i < state.range(0); ++i) {
-      InstallLog(std::to_string(i), "/volume1/logs/" + std::to_string(i));
-    }
+    ForgetLogs(state.range(0));
     sync();  // the commit waits for the disk with its own files only
     state.ResumeTiming();
   }
