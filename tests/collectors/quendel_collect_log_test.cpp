@@ -115,6 +115,14 @@ Pairs With(Pairs pairs, const std::string& key, const std::string& value) {
   return pairs;
 }
 
+// Collects, which must fail to copy the log's new lines and must not count them as collected.
+void ExpectFailedDiff(const std::string& conf) {
+  EXPECT_EQ(Collect(), 0);
+  EXPECT_THAT(Log(), LoggedInOrder(std::string("Failed to collect diff log '") + kLog + "'",
+                                   FailedIn(conf)));
+  EXPECT_FALSE(Exists(kLogUpdateFile));
+}
+
 }  // namespace
 
 // ---- The run ----
@@ -495,10 +503,7 @@ TEST(CollectLogTest, FailsWhenTheNewLinesCannotBeWritten) {
   AppendFile(kLog, "two\n");
   OnFileCalls().sendfile = FailsWith(ENOSPC);
   OnFileCalls().write = FailsWith(ENOSPC);
-  EXPECT_EQ(Collect(), 0);
-  EXPECT_THAT(Log(), LoggedInOrder(std::string("Failed to collect diff log '") + kLog + "'",
-                                   FailedIn(conf)));
-  EXPECT_FALSE(Exists(kLogUpdateFile));
+  ExpectFailedDiff(conf);
 }
 
 TEST(CollectLogTest, FailsWhenTheNewLinesCannotBeReadBack) {
@@ -509,20 +514,14 @@ TEST(CollectLogTest, FailsWhenTheNewLinesCannotBeReadBack) {
     errno = EIO;
     return count != 1 || ++read != 2;
   };
-  EXPECT_EQ(Collect(), 0);
-  EXPECT_THAT(Log(), LoggedInOrder(std::string("Failed to collect diff log '") + kLog + "'",
-                                   FailedIn(conf)));
-  EXPECT_FALSE(Exists(kLogUpdateFile));
+  ExpectFailedDiff(conf);
 }
 
 TEST(CollectLogTest, FailsWhenTheNewLinesAreLostAtTheEnd) {
   const std::string conf = InstallCollected("one\n");
   AppendFile(kLog, "two\n");
   OnFileCalls().close = [](int file) { return PathOfDescriptor(file) != kOutput; };
-  EXPECT_EQ(Collect(), 0);
-  EXPECT_THAT(Log(), LoggedInOrder(std::string("Failed to collect diff log '") + kLog + "'",
-                                   FailedIn(conf)));
-  EXPECT_FALSE(Exists(kLogUpdateFile));
+  ExpectFailedDiff(conf);
 }
 
 TEST(CollectLogTest, FailsWhenTheStateOfAContinuedLogCannotBeStaged) {

@@ -45,6 +45,13 @@ void MakeSshDir() {
   ASSERT_EQ(mkdir(kSshDir, 0755), 0);
 }
 
+// Makes the account, which must fail because its key file is not opened.
+void ExpectKeyFileNotOpened() {
+  EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), -1);
+  EXPECT_THAT(Log(),
+              ElementsAre(Logged(kUnit, "Failed to open '/run/quendelhome/.ssh/authorized_keys'")));
+}
+
 }  // namespace
 
 // ---- Creating it.
@@ -160,18 +167,14 @@ TEST(SupportAccountUserCreateTest, TakesAnyResultButANegativeOneForPrepared) {
 TEST(SupportAccountUserCreateTest, FailsWhenTheKeyFileCannotBeOpened) {
   MakeSshDir();
   ASSERT_EQ(mkdir(kKeyFile, 0755), 0);
-  EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), -1);
-  EXPECT_THAT(Log(),
-              ElementsAre(Logged(kUnit, "Failed to open '/run/quendelhome/.ssh/authorized_keys'")));
+  ExpectKeyFileNotOpened();
 }
 
 TEST(SupportAccountUserCreateTest, FollowsNoLinkInPlaceOfTheKeyFile) {
   MakeSshDir();
   WriteFile("/tmp/shadow", "theirs");
   ASSERT_EQ(symlink("/tmp/shadow", kKeyFile), 0);
-  EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), -1);
-  EXPECT_THAT(Log(),
-              ElementsAre(Logged(kUnit, "Failed to open '/run/quendelhome/.ssh/authorized_keys'")));
+  ExpectKeyFileNotOpened();
   EXPECT_EQ(ReadFile("/tmp/shadow"), "theirs");
 }
 
@@ -179,18 +182,14 @@ TEST(SupportAccountUserCreateTest, FollowsNoLinkInPlaceOfTheSshDir) {
   ASSERT_EQ(mkdir(kHome, 0755), 0);
   ASSERT_EQ(mkdir("/tmp/elsewhere", 0755), 0);
   ASSERT_EQ(symlink("/tmp/elsewhere", kSshDir), 0);
-  EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), -1);
-  EXPECT_THAT(Log(),
-              ElementsAre(Logged(kUnit, "Failed to open '/run/quendelhome/.ssh/authorized_keys'")));
+  ExpectKeyFileNotOpened();
   EXPECT_FALSE(Exists("/tmp/elsewhere/authorized_keys"));
 }
 
 TEST(SupportAccountUserCreateTest, DoesNotWaitForTheReaderOfAFifo) {
   MakeSshDir();
   ASSERT_EQ(mkfifo(kKeyFile, 0644), 0);
-  EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), -1);
-  EXPECT_THAT(Log(),
-              ElementsAre(Logged(kUnit, "Failed to open '/run/quendelhome/.ssh/authorized_keys'")));
+  ExpectKeyFileNotOpened();
 }
 
 TEST(SupportAccountUserCreateTest, RefusesAFifoThatIsRead) {
@@ -198,9 +197,7 @@ TEST(SupportAccountUserCreateTest, RefusesAFifoThatIsRead) {
   ASSERT_EQ(mkfifo(kKeyFile, 0644), 0);
   const int reader = open(kKeyFile, O_RDONLY | O_NONBLOCK);
   ASSERT_GE(reader, 0);
-  EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), -1);
-  EXPECT_THAT(Log(),
-              ElementsAre(Logged(kUnit, "Failed to open '/run/quendelhome/.ssh/authorized_keys'")));
+  ExpectKeyFileNotOpened();
   char byte = 0;
   EXPECT_EQ(read(reader, &byte, 1), 0);  // nobody wrote the key
 }
@@ -209,9 +206,7 @@ TEST(SupportAccountUserCreateTest, LeavesAFileAloneThatHasAnotherName) {
   MakeSshDir();
   WriteFile("/run/other", "theirs");
   ASSERT_EQ(link("/run/other", kKeyFile), 0);
-  EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), -1);
-  EXPECT_THAT(Log(),
-              ElementsAre(Logged(kUnit, "Failed to open '/run/quendelhome/.ssh/authorized_keys'")));
+  ExpectKeyFileNotOpened();
   EXPECT_EQ(ReadFile("/run/other"), "theirs");
 }
 
