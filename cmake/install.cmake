@@ -44,7 +44,7 @@ string(REGEX REPLACE "/$" "" prefix_from_pkgconfig ${prefix_from_pkgconfig})
 configure_file(cmake/quendel.pc.in quendel.pc @ONLY)
 install(FILES ${CMAKE_CURRENT_BINARY_DIR}/quendel.pc DESTINATION ${pkgconfig_dir})
 
-if(QUENDEL_BUILD_TOOLS)
+if(QUENDEL_BUILD_QUENDELCTL)
   file(RELATIVE_PATH libraries_from_programs /${CMAKE_INSTALL_BINDIR} /${CMAKE_INSTALL_LIBDIR})
   set_target_properties(quendelctl PROPERTIES INSTALL_RPATH "$ORIGIN/${libraries_from_programs}")
   install(TARGETS quendelctl RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR})
