@@ -29,16 +29,10 @@
 // When `removeAfter` is not 0 the run directory and the archive are gone when the function returns,
 // whatever it returns. When it is 0 both stay, and are the caller's to remove.
 //
-// Call this in a worker process that does nothing else and leads a session of its own (fork, then
-// setsid), and take the result from its exit status:
-//  * it reaps whichever child of the process ends, and a foreign one that ends meanwhile fails the
-//    run;
-//  * a run that fails before both of its children were started sends SIGTERM to the whole process
-//    group of the caller, the caller included. One that this ends leaves the run directory and the
-//    marker file of a child that was started, whatever `removeAfter` says: its parent removes them;
-//  * it fails when the process ignores SIGCHLD;
-//  * a child that does not end after SIGTERM keeps it from returning.
-// One run at a time on a device: runs share the files in which they note what they collected.
+// Call this in a worker process that does nothing else and leads a session of its own, one at a
+// time on a device: a run reaps any child of the process, and one that fails early can send SIGTERM
+// to the whole process group of its caller. "Running a collection" in docs/integration.md says how
+// to make the worker, and what it must not have.
 //
 // Returns 0 when the archive was made and, if asked, accepted, and both kinds of collectors'
 // settings were brought up to date; else -1.
@@ -98,7 +92,7 @@ QUENDEL_EXPORT int QUENDELSendCollectData(const char* archive, long timestamp);
 
 // The shared-memory channel hands one block of bytes from one process to another, through a System
 // V segment whose key and size in bytes both sides agree on. One process creates the segment; then,
-// in either order and each within the other's 20 seconds, one sends and the other receives.
+// in either order, one sends and the other receives. Each waits 20 seconds for the other.
 //
 // The segment's first byte tells how the exchange stands: 0 is "nothing sent yet" and '*' is
 // "received". So a block must not begin with a zero byte, which the receiver would wait for in
@@ -112,16 +106,16 @@ QUENDEL_EXPORT int QUENDELSendCollectData(const char* archive, long timestamp);
 // Returns 0, or -1 when the segment could not be made or attached.
 QUENDEL_EXPORT int QUENDELShmAlloc(size_t size, int key);
 
-// Writes `size` bytes of data into the segment and waits up to 20 seconds for the receiver. The
-// segment is not removed.
+// Writes `size` bytes of data into the segment and waits for the receiver. The segment is not
+// removed.
 //
 // Returns 0 when the block was received, -2 at once when there is no such segment, and -1 when it
 // could not be attached or nobody received the block in time.
 QUENDEL_EXPORT int QUENDELShmSend(char* data, size_t size, int key);
 
-// Waits up to 20 seconds for a block and copies `size` bytes of it into buf, which has room for
-// them. The segment is removed in every case: it goes when its creator and the sender have let go
-// of it. While the system refuses that, the call does not come back.
+// Waits for a block and copies `size` bytes of it into buf, which has room for them. The segment is
+// removed in every case: it goes when its creator and the sender have let go of it. While the
+// system refuses that, the call does not come back.
 //
 // Returns 0 when a block was received, -2 at once when there is no such segment, and -1, with buf
 // untouched, when it could not be attached or nobody sent a block in time.

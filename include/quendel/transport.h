@@ -1,4 +1,6 @@
-// The exchanges with the service's server.
+// The exchanges with the service's server: HTTPS on TCP port 51790. Neither the server's
+// certificate nor its host name is verified, and a reply is held in memory whole, whatever its
+// size. docs/protocol.md shows each exchange.
 #ifndef QUENDEL_TRANSPORT_H_
 #define QUENDEL_TRANSPORT_H_
 
@@ -32,12 +34,10 @@ extern QUENDEL_EXPORT const std::map<int, _tag_WEBAPI_CORE_ERR> QUENDELWebapiErr
 // Returns the URL; never fails.
 QUENDEL_EXPORT std::string QUENDELGenerateReq(const std::vector<std::string>& pieces);
 
-// Posts a JSON value to the server, on TCP port 51790, and reads its JSON reply.
+// Posts a JSON value to the server and reads its JSON reply.
 //
-// The certificate and the host name of the server are not verified. Replies are held in memory
-// whole, whatever their size. `response` receives the reply whenever that was JSON, also when the
-// status was not 200; otherwise it is untouched. Whether the reply reports success is for the
-// caller to judge.
+// `response` receives the reply whenever that was JSON, also when the status was not 200; otherwise
+// it is untouched. Whether the reply reports success is for the caller to judge.
 //
 // The first transfer of a process initialises libcurl, which must not race with another thread's
 // first transfer; later calls may run in parallel.
@@ -67,8 +67,8 @@ QUENDEL_EXPORT int QUENDELParseResponse(const std::string& text);
 QUENDEL_EXPORT int QUENDELGetWebapiError(int code);
 
 // Tells whether the server can be reached: two connections in a row, a second apart, must succeed
-// within six attempts on TCP port 51790 of the first IPv4 address of the server host. Nothing is
-// sent. Takes up to five seconds and the system's own time for each connection.
+// within six attempts at the first IPv4 address of the server host. Nothing is sent. Takes up to
+// five seconds and the system's own time for each connection.
 //
 // Each failed attempt leaves its socket open, so a call can cost the process up to six descriptors.
 // Not safe to call from several threads at once.
@@ -76,9 +76,9 @@ QUENDEL_EXPORT int QUENDELGetWebapiError(int code);
 // Returns 1 when the server is reachable, else 0.
 QUENDEL_EXPORT int QUENDELIsServerReachable();
 
-// Posts files to the server, on TCP port 51790, as one multipart/form-data request: a part for each
-// file, in the order of `items`, and last a text part that holds a JSON array with the description
-// of each file. Every part has the name `name`. No item at all still posts the array, empty.
+// Posts files to the server as one multipart/form-data request: a part for each file, in the order
+// of `items`, and last a text part that holds a JSON array with the description of each file. Every
+// part has the name `name`. No item at all still posts the array, empty.
 //
 // Files are read from disk while they are sent, whatever their size, and must stay in place until
 // the function returns. File name and content type of a part are what libcurl derives from the
@@ -89,8 +89,8 @@ QUENDEL_EXPORT int QUENDELIsServerReachable();
 // its entry, so its entries may be fewer than the files. A file that cannot be opened fails the
 // whole post.
 //
-// The certificate and the host name of the server are not verified. The list of parts, some hundred
-// bytes for each file and not the files' contents, is kept until the process exits.
+// The list of parts, some hundred bytes for each file and not the files' contents, is kept until
+// the process exits.
 //
 // Returns 0 when the server answered with status 200 and a reply that reports success, as
 // QUENDELParseResponse() judges it, else -1.

@@ -240,12 +240,12 @@ Action DeclareShm(CLI::App& command) {
   quendelctl shm alloc 0x51 4096
   quendelctl shm alloc 0x51 4096 --hold &)",
            DeclareAlloc},
-          {"send", "Put a block into a segment and wait 20 seconds for its receiver",
+          {"send", "Put a block into a segment and wait for its receiver",
            R"(Examples:
   quendelctl shm send 0x51 block.bin
   echo hello | quendelctl shm send 0x51)",
            DeclareSend},
-          {"receive", "Wait 20 seconds for a block, show it, and remove the segment",
+          {"receive", "Wait for a block, show it, and remove the segment",
            R"(The bytes are printed as they are; a terminal gets those escaped that could act on it.
 
 Examples:
