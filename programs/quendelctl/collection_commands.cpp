@@ -10,6 +10,7 @@
 #include <memory>
 
 #include "arguments.h"
+#include "base/paths.h"
 #include "command.h"
 #include "progress.h"
 #include "quendel.h"
@@ -52,7 +53,7 @@ WorkerEnd Collect(bool send, const Json::Value& series, RunWatch& run) {
 void RemoveStaleMarkers() {
   constexpr char kMarker[] = "xxx.p.";  // "udc" or "log", then the process id
   std::error_code error;
-  for (const auto& entry : fs::directory_iterator("/tmp/quendel", error)) {
+  for (const auto& entry : fs::directory_iterator(quendel::kWorkRoot, error)) {
     const std::string name = entry.path().filename();
     if (name.rfind("udc.p.", 0) != 0 && name.rfind("log.p.", 0) != 0) {
       continue;

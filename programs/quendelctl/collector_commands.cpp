@@ -7,6 +7,7 @@
 #include <cstring>
 #include <memory>
 
+#include "base/paths.h"
 #include "collector_files.h"
 #include "command.h"
 #include "quendel.h"
@@ -15,7 +16,7 @@ namespace quendelctl {
 namespace {
 
 std::string PathOf(const std::string& file) {
-  return std::string(kCollectorFolder) + "/" + file;
+  return std::string(quendel::kCollectorConfDir) + "/" + file;
 }
 
 bool IsLog(const std::string& file) {
@@ -138,7 +139,8 @@ std::vector<std::string> AllCollectors(std::string* error = nullptr) {
 }
 
 std::string CannotList(const std::string& error) {
-  return std::string("The collectors in ") + kCollectorFolder + " cannot be listed: " + error + ".";
+  return std::string("The collectors in ") + quendel::kCollectorConfDir +
+         " cannot be listed: " + error + ".";
 }
 
 Result ListCollectors() {

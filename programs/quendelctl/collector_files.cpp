@@ -4,13 +4,15 @@
 #include <algorithm>
 #include <filesystem>
 
+#include "base/paths.h"
+
 namespace quendelctl {
 
 std::vector<std::string> CollectorFiles(const char* prefix, std::string* error) {
   namespace fs = std::filesystem;
   std::vector<std::string> names;
   std::error_code problem;
-  for (fs::directory_iterator entry(kCollectorFolder, problem);
+  for (fs::directory_iterator entry(quendel::kCollectorConfDir, problem);
        !problem && entry != fs::directory_iterator(); entry.increment(problem)) {
     const std::string name = entry->path().filename();
     std::error_code ignored;  // what cannot be examined is no regular file

@@ -7,12 +7,11 @@
 
 namespace quendelctl {
 
-inline constexpr char kCollectorFolder[] = "/usr/arvo/etc/quendel";
 inline constexpr char kLogPrefix[] = "quendel.log.";
 inline constexpr char kUdcPrefix[] = "quendel.udc.";
 
-// Returns the names of the regular files in that folder that begin with the prefix, sorted. A
-// folder that cannot be listed gives none, and `error`, when given, receives the reason.
+// Returns the names of the regular files in the collectors' folder that begin with the prefix,
+// sorted. A folder that cannot be listed gives none, and `error`, when given, receives the reason.
 std::vector<std::string> CollectorFiles(const char* prefix, std::string* error = nullptr);
 
 }  // namespace quendelctl

@@ -6,6 +6,7 @@
 #include <memory>
 
 #include "arguments.h"
+#include "base/paths.h"
 #include "command.h"
 #include "quendel.h"
 #include "session_file.h"
@@ -76,7 +77,7 @@ Result OpenSession(const std::string& user, const std::string& key, bool stopSsh
   }
   const SessionFile file = WriteSessionFile(user, stopSshd);
   if (file == SessionFile::kExists) {
-    syslog(LOG_ERR, "a remote session is open already: %s exists", kSessionFile);
+    syslog(LOG_ERR, "a remote session is open already: %s exists", quendel::kRemoteConfFile);
   }
   if (file != SessionFile::kWritten) {
     return result;

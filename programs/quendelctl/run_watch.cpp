@@ -8,6 +8,7 @@
 #include <filesystem>
 #include <memory>
 
+#include "base/paths.h"
 #include "collector_files.h"
 
 namespace quendelctl {
@@ -54,7 +55,7 @@ std::string LogName(const std::string& file) {
 // A settings file is replaced by another when it changes, and its folder changes with that.
 timespec SettingsChanged() {
   struct stat status = {};
-  return stat(kCollectorFolder, &status) == 0 ? status.st_mtim : timespec{};
+  return stat(quendel::kCollectorConfDir, &status) == 0 ? status.st_mtim : timespec{};
 }
 
 bool HaveSettingsChanged(const timespec& before) {

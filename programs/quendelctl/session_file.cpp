@@ -9,11 +9,10 @@
 #include <cstdio>
 #include <cstdlib>
 
+#include "base/paths.h"
+
 namespace quendelctl {
 namespace {
-
-constexpr char kFolder[] = "/usr/arvo/etc";
-constexpr char kTemporaryPattern[] = "/usr/arvo/etc/.quendel.remote.conf.XXXXXX";
 
 bool WriteAll(int file, const std::string& text) {
   size_t written = 0;
@@ -30,7 +29,7 @@ bool WriteAll(int file, const std::string& text) {
 // Makes a temporary file, with mode 0600, that holds the text and has reached the disk. Returns its
 // path, or an empty text with errno set.
 std::string WriteTemporary(const std::string& text) {
-  std::string path = kTemporaryPattern;
+  std::string path = std::string(quendel::kSettingsDir) + "/.quendel.remote.conf.XXXXXX";
   const int file = mkostemp(path.data(), O_CLOEXEC);
   if (file < 0) {
     return "";
@@ -47,7 +46,7 @@ std::string WriteTemporary(const std::string& text) {
 }
 
 bool SyncFolder() {
-  const int folder = open(kFolder, O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+  const int folder = open(quendel::kSettingsDir, O_RDONLY | O_DIRECTORY | O_CLOEXEC);
   if (folder < 0) {
     return false;
   }
@@ -57,7 +56,7 @@ bool SyncFolder() {
 }
 
 SessionFile Fail() {
-  syslog(LOG_ERR, "cannot write %s: %m", kSessionFile);
+  syslog(LOG_ERR, "cannot write %s: %m", quendel::kRemoteConfFile);
   return SessionFile::kFailed;
 }
 
@@ -70,7 +69,8 @@ SessionFile WriteSessionFile(const std::string& account, bool stopSshd) {
   if (temporary.empty()) {
     return Fail();
   }
-  if (renameat2(AT_FDCWD, temporary.c_str(), AT_FDCWD, kSessionFile, RENAME_NOREPLACE) != 0) {
+  if (renameat2(AT_FDCWD, temporary.c_str(), AT_FDCWD, quendel::kRemoteConfFile,
+                RENAME_NOREPLACE) != 0) {
     const int error = errno;
     unlink(temporary.c_str());
     errno = error;
@@ -78,15 +78,15 @@ SessionFile WriteSessionFile(const std::string& account, bool stopSshd) {
   }
   if (!SyncFolder()) {
     Fail();
-    unlink(kSessionFile);
+    unlink(quendel::kRemoteConfFile);
     return SessionFile::kFailed;
   }
   return SessionFile::kWritten;
 }
 
 bool RemoveSessionFile() {
-  if (unlink(kSessionFile) != 0) {
-    syslog(LOG_ERR, "cannot remove %s: %m", kSessionFile);
+  if (unlink(quendel::kRemoteConfFile) != 0) {
+    syslog(LOG_ERR, "cannot remove %s: %m", quendel::kRemoteConfFile);
     return false;
   }
   return true;

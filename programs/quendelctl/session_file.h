@@ -6,8 +6,6 @@
 
 namespace quendelctl {
 
-constexpr char kSessionFile[] = "/usr/arvo/etc/quendel.remote.conf";
-
 // What came of writing the file.
 enum class SessionFile { kWritten, kExists, kFailed };
 

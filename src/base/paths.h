@@ -1,11 +1,13 @@
-// The one home of every fixed path on the appliance that the library reads or writes. The name of a
-// run's own directory is made where the run gets it.
+// The one home of every fixed path on the appliance that the library, its platform and the programs
+// around it share. The name of a run's own directory is made where the run gets it.
 #ifndef BASE_PATHS_H_
 #define BASE_PATHS_H_
 
 namespace quendel {
 
-// Settings.
+// Settings, and where they lie. Only the stand-alone platform reads device.conf.
+inline constexpr char kSettingsDir[] = "/usr/arvo/etc";
+inline constexpr char kDeviceConfFile[] = "/usr/arvo/etc/device.conf";
 inline constexpr char kServiceConfFile[] = "/usr/arvo/etc/quendel.conf";
 inline constexpr char kDefaultsFile[] = "/etc.defaults/arvoinfo.conf";
 inline constexpr char kVersionFile[] = "/etc.defaults/VERSION";

@@ -1,6 +1,7 @@
 // Who this device is, as the stand-alone platform's own file tells it.
 #include "platform/standalone/device_conf.h"
 
+#include "base/paths.h"
 #include "platform/standalone/error_code.h"
 #include "platform/standalone/file_io.h"
 #include "platform/standalone/key_value_text.h"
@@ -8,7 +9,7 @@
 namespace platform {
 
 bool DeviceConf::Read() {
-  return ReadWholeFile(kDeviceConfPath, text_);
+  return ReadWholeFile(quendel::kDeviceConfFile, text_);
 }
 
 std::string DeviceConf::Value(const std::string& key) const {

@@ -6,11 +6,9 @@
 
 namespace platform {
 
-// A flat key-value file. Its keys: serial_number, account_email, account_field_a, account_field_b,
-// timezone (a name such as Europe/Berlin), and service_<name> (yes or no) for each service.
-constexpr char kDeviceConfPath[] = "/usr/arvo/etc/device.conf";
-
-// The file's text, read once for several keys.
+// The text of quendel::kDeviceConfFile, read once for several keys. It is a flat key-value file
+// with the keys serial_number, account_email, account_field_a, account_field_b, timezone (a name
+// such as Europe/Berlin), and service_<name> (yes or no) for each service.
 class DeviceConf {
  public:
   // Returns false with the last error set when the file cannot be read.

@@ -12,6 +12,7 @@
 #include <string>
 #include <vector>
 
+#include "base/paths.h"
 #include "platform/standalone/error_code.h"
 #include "platform/standalone/file_io.h"
 #include "platform/standalone/result_record.h"
@@ -24,7 +25,6 @@ constexpr int kSupportKind = 5;
 constexpr uid_t kSupportUid = 50001;
 constexpr char kSupportUidText[] = "50001";
 constexpr char kSupportGidText[] = "100";
-constexpr char kSupportHome[] = "/run/quendelhome";
 constexpr char kSupportShell[] = "/bin/sh";
 
 // No password matches this one, and it does not lock the account: a key still lets in.
@@ -87,15 +87,15 @@ int FailForTool() {
 int AddSupportAccount(const char* name) {
   const int status =
       RunProgram({kUserAdd, "--no-create-home", "--no-user-group", "--uid", kSupportUidText,
-                  "--gid", kSupportGidText, "--home-dir", kSupportHome, "--shell", kSupportShell,
-                  "--password", kNoPassword, name});
+                  "--gid", kSupportGidText, "--home-dir", quendel::kSupportHome, "--shell",
+                  kSupportShell, "--password", kNoPassword, name});
   return status == 0 ? 0 : FailForTool();
 }
 
 // An earlier session may have left the account in any state.
 int RestoreSupportAccount(const char* name) {
   const int status =
-      RunProgram({kUserMod, "--gid", kSupportGidText, "--home", kSupportHome, "--shell",
+      RunProgram({kUserMod, "--gid", kSupportGidText, "--home", quendel::kSupportHome, "--shell",
                   kSupportShell, "--password", kNoPassword, "--expiredate", "", name});
   return status == 0 ? 0 : FailForTool();
 }
