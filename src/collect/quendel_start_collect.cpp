@@ -28,7 +28,6 @@ namespace {
 constexpr char kLogUnit[] = "quendel_start_collect";
 
 constexpr int kDefaultWaitLimitSeconds = 600;
-constexpr int kForkFlags = 0xBB;
 constexpr mode_t kPrivateMode = 0700;
 
 // What each kind of child does, and what it logs when that fails.
@@ -343,7 +342,7 @@ int StartCollectorChild(CollectorChild& child) {
   // the fork could see the signal swallowed by a handler that the child inherited.
   sigset_t before;
   MaskSigterm(SIG_BLOCK, &before);
-  const int id = ALIBCProcForkEx(kForkFlags);
+  const int id = ALIBCProcForkEx(platform::kRunFlags);
   if (id == 0) {
     GatherAndExit(*collector, child.directory);
   }

@@ -10,8 +10,6 @@ namespace {
 
 constexpr char kLogUnit[] = "quendel_tar_collect_data";
 
-constexpr int kRunFlags = 0xBB;
-
 }  // namespace
 }  // namespace quendel
 
@@ -22,8 +20,8 @@ int QUENDELTarCollectData(const char* dir, const char* archive) try {
   const size_t slash = path.rfind('/');
   const std::string parent = path.substr(0, slash);
   const std::string base = slash == std::string::npos ? path : path.substr(slash + 1);
-  if (ALIBCExecl("/bin/tar", kRunFlags, "-C", parent.c_str(), "-Jcvf", archive, base.c_str(),
-                 nullptr) != 0) {
+  if (ALIBCExecl("/bin/tar", platform::kRunFlags, "-C", parent.c_str(), "-Jcvf", archive,
+                 base.c_str(), nullptr) != 0) {
     QUENDEL_LOG("Failed to tar '%s'", dir);
     return -1;
   }

@@ -1,54 +1,18 @@
 // Lines of files of any size and of any length, in constant memory.
 #include "collectors/line_copy.h"
 
-#include <fcntl.h>
-#include <sys/sendfile.h>
 #include <sys/stat.h>
-#include <unistd.h>
 
 #include <algorithm>
-#include <cerrno>
 #include <cstring>
 #include <limits>
+
+#include "base/file_io.h"
 
 namespace quendel {
 namespace {
 
 constexpr size_t kBlockBytes = 64 << 10;
-
-// The most that one call to the kernel is asked to move.
-constexpr int64_t kMostMovedBytes = 1 << 30;
-
-// Reads `count` bytes at an offset, or those up to the end of the file. Returns how many there
-// were, negative on failure.
-ssize_t ReadAt(int file, char* buffer, int64_t count, int64_t offset) {
-  ssize_t done = 0;
-  while (done < count) {
-    const ssize_t got =
-        pread(file, buffer + done, static_cast<size_t>(count - done), offset + done);
-    if (got == 0) {
-      break;
-    }
-    if (got < 0 && errno != EINTR) {
-      return -1;
-    }
-    done += std::max<ssize_t>(got, 0);
-  }
-  return done;
-}
-
-bool WriteAll(int file, const char* bytes, size_t count) {
-  while (count > 0) {
-    const ssize_t written = write(file, bytes, count);
-    if (written < 0 && errno != EINTR) {
-      return false;
-    }
-    const size_t done = static_cast<size_t>(std::max<ssize_t>(written, 0));
-    bytes += done;
-    count -= done;
-  }
-  return true;
-}
 
 int64_t FileSize(int file) {
   struct stat status;
@@ -105,50 +69,6 @@ bool AddBytes(int file, int64_t begin, int64_t end, Md5& md5) {
   return true;
 }
 
-// One way to move bytes from an offset of one file to the position of another. Returns how many
-// were moved, 0 at the end of the source, negative on failure.
-using Move = ssize_t (*)(int source, off_t& offset, int64_t count, int sink);
-
-// Shares the blocks where the file system can, and copies inside the kernel where it cannot.
-ssize_t MoveByRange(int source, off_t& offset, int64_t count, int sink) {
-  return copy_file_range(source, &offset, sink, nullptr, static_cast<size_t>(count), 0);
-}
-
-// Between two file systems.
-ssize_t MoveBySendfile(int source, off_t& offset, int64_t count, int sink) {
-  return sendfile(sink, source, &offset, static_cast<size_t>(count));
-}
-
-ssize_t MoveByHand(int source, off_t& offset, int64_t count, int sink) {
-  char block[kBlockBytes];
-  const ssize_t got = ReadAt(source, block, std::min<int64_t>(count, sizeof block), offset);
-  if (got <= 0) {
-    return got;
-  }
-  if (!WriteAll(sink, block, static_cast<size_t>(got))) {
-    return -1;
-  }
-  offset += got;
-  return got;
-}
-
-// Copies the bytes from `begin` to `end`, or to the end of the source where that comes first. What
-// one way of moving them cannot do is left to the next; the last one tells what is a failure.
-// Returns how many were copied, negative on failure.
-int64_t CopyBytes(int source, int64_t begin, int64_t end, int sink) {
-  off_t offset = begin;
-  ssize_t moved = 0;
-  for (const Move move : {MoveByRange, MoveBySendfile, MoveByHand}) {
-    do {
-      if (offset == end) {
-        return end - begin;
-      }
-      moved = move(source, offset, std::min<int64_t>(end - offset, kMostMovedBytes), sink);
-    } while (moved > 0 || (moved < 0 && errno == EINTR));
-  }
-  return moved < 0 ? -1 : offset - begin;
-}
-
 }  // namespace
 
 LineMark EmptyLine(int64_t end) {
@@ -156,16 +76,6 @@ LineMark EmptyLine(int64_t end) {
   Md5().Finish(line.hash);
   line.end = end;
   return line;
-}
-
-OwnedFd OpenRegularFile(const char* path, int64_t& size) {
-  OwnedFd file(open(path, O_RDONLY | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
-  struct stat status;
-  if (!file || fstat(file.get(), &status) != 0 || !S_ISREG(status.st_mode)) {
-    return OwnedFd();
-  }
-  size = status.st_size;
-  return file;
 }
 
 ReadResult ReadLine(int file, int64_t start, LineMark& line) {
@@ -222,7 +132,7 @@ int64_t CopyLines(int source, int64_t start, int64_t limit, int sink) {
   if (end < 0) {
     return -1;
   }
-  const int64_t copied = CopyBytes(source, start, end, sink);
+  const int64_t copied = CopyRange(source, start, end, sink);
   if (copied <= 0) {
     return copied;
   }
@@ -230,11 +140,11 @@ int64_t CopyLines(int source, int64_t start, int64_t limit, int sink) {
   if (ReadAt(sink, &last, 1, copied - 1) != 1) {
     return -1;
   }
-  return last == '\n' || WriteAll(sink, "\n", 1) ? copied : -1;
+  return last == '\n' || WriteAll(sink, "\n") ? copied : -1;
 }
 
 bool CopyWhole(int source, int sink) {
-  return CopyBytes(source, 0, std::numeric_limits<int64_t>::max(), sink) >= 0;
+  return CopyRange(source, 0, std::numeric_limits<int64_t>::max(), sink) >= 0;
 }
 
 }  // namespace quendel

@@ -8,7 +8,6 @@
 #include <cstdint>
 
 #include "base/md5.h"
-#include "base/owned_fd.h"
 
 namespace quendel {
 
@@ -23,10 +22,6 @@ struct LineMark {
 LineMark EmptyLine(int64_t end);
 
 enum class ReadResult { kLine, kNoLine, kError };
-
-// Opens a regular file for reading. Anything else is refused, and never waited for: a FIFO would
-// keep its reader until somebody writes. `size` receives the file's length.
-OwnedFd OpenRegularFile(const char* path, int64_t& size);
 
 // Reads the line that begins at `start`. There is none at the end of the file or behind it.
 ReadResult ReadLine(int file, int64_t start, LineMark& line);

@@ -11,8 +11,8 @@
 #include <memory>
 #include <string>
 
+#include "base/file_io.h"
 #include "base/log.h"
-#include "base/owned_fd.h"
 #include "base/paths.h"
 #include "collectors/line_copy.h"
 #include "platform/file.h"
@@ -32,9 +32,6 @@ constexpr char kLogUnit[] = "quendel_collect_log";
 
 constexpr int kListSize = 512;
 constexpr int kStagedHashSize = 256;
-
-// What the platform's listing takes for "regular files only".
-constexpr int kEnumFilesFlags = 130;
 
 using Path = char[256];
 
@@ -116,14 +113,14 @@ DiffResult FindLastCollected(const LogTask& task, const char* source, int file, 
 
 // Copies the lines that follow the last one collected, as far as `limit`.
 DiffResult CopyDiff(const LogTask& task, const char* source, const char* output, int64_t limit) {
-  int64_t size = 0;
-  OwnedFd in = OpenRegularFile(source, size);
+  struct stat status = {};
+  const OwnedFd in = OpenRegularFile(source, status);
   if (!in) {
     QUENDEL_LOG("Failed to open file '%s'", source);
     return DiffResult::kError;
   }
   LineMark last;
-  const DiffResult found = FindLastCollected(task, source, in.get(), size, last);
+  const DiffResult found = FindLastCollected(task, source, in.get(), status.st_size, last);
   if (found != DiffResult::kDone) {
     return found;
   }
@@ -143,9 +140,9 @@ DiffResult CopyDiff(const LogTask& task, const char* source, const char* output,
   }
   // Without a new line the state becomes the empty line in front of the end.
   if (copied == 0) {
-    last = EmptyLine(size);
+    last = EmptyLine(status.st_size);
   }
-  if (!StageLogState(task, last, copied == 0 ? size : start + copied)) {
+  if (!StageLogState(task, last, copied == 0 ? status.st_size : start + copied)) {
     QUENDEL_LOG("Failed to update config of log '%s'", source);
     return DiffResult::kError;
   }
@@ -154,8 +151,8 @@ DiffResult CopyDiff(const LogTask& task, const char* source, const char* output,
 
 // Appends the snapshot of a source to an output that holds an archive's lines already.
 bool AppendSnapshot(const char* source, const char* output, const char* snapshot) {
-  int64_t size = 0;
-  const OwnedFd in = OpenRegularFile(snapshot, size);
+  struct stat status = {};
+  const OwnedFd in = OpenRegularFile(snapshot, status);
   if (!in) {
     QUENDEL_LOG("Failed to open file '%s'", snapshot);
     return false;
@@ -222,8 +219,8 @@ bool CopyWholeAndStage(const LogTask& task, const char* source, const char* outp
   if (!StageValue(task, "inode", inodeText)) {
     return false;
   }
-  int64_t size = 0;
-  const OwnedFd out = OpenRegularFile(output, size);
+  struct stat status = {};
+  const OwnedFd out = OpenRegularFile(output, status);
   LineMark last = EmptyLine(0);
   if (!out || ReadLastLine(out.get(), last) == ReadResult::kError) {
     QUENDEL_LOG("Failed to open file '%s'", output);
@@ -455,7 +452,8 @@ int QUENDELCollectLog(const char* dstDir) try {
     return -1;
   }
   RemoveIfExists(kLogUpdateFile);
-  if (ALIBCFileEnumDir(kCollectorConfDir, "quendel.log.", names.slot(), kEnumFilesFlags) < 0) {
+  if (ALIBCFileEnumDir(kCollectorConfDir, "quendel.log.", names.slot(),
+                       platform::kEnumRegularFiles) < 0) {
     QUENDEL_LOG("Failed to enum dir '%s'", kCollectorConfDir);
     return -1;
   }

@@ -30,9 +30,6 @@ constexpr int kStagedHashSize = 128;
 constexpr size_t kReadBytes = 1024;
 constexpr size_t kHashTextBytes = 64;
 
-// What the platform's listing takes for "regular files only".
-constexpr int kEnumFilesFlags = 130;
-
 using Path = char[256];
 
 // A running collector. Closing waits until it has ended; how it ended does not matter.
@@ -200,7 +197,8 @@ int QUENDELCollectUDC(const char* dstDir) try {
   if (ALIBCFileExist(kUdcUpdateFile) == 1 && remove(kUdcUpdateFile) != 0) {
     QUENDEL_LOG("Failed to remove %s [errno=%d]", kUdcUpdateFile, errno);
   }
-  if (ALIBCFileEnumDir(kCollectorConfDir, "quendel.udc.", names.slot(), kEnumFilesFlags) < 0) {
+  if (ALIBCFileEnumDir(kCollectorConfDir, "quendel.udc.", names.slot(),
+                       platform::kEnumRegularFiles) < 0) {
     QUENDEL_LOG("Failed to enum dir '%s'", kCollectorConfDir);
     return -1;
   }

@@ -5,6 +5,13 @@
 struct ALIBSZLIST;
 struct stat;
 
+namespace platform {
+
+// What a listing takes for "regular files, or links to one", the only kind that is asked for.
+constexpr int kEnumRegularFiles = 130;
+
+}  // namespace platform
+
 extern "C" {
 
 // Returns 1 when the path exists, whatever it is, else 0. A link to nothing does not exist.
@@ -19,9 +26,9 @@ int ALIBCFileCheckDir(const char* path);
 int ALIBCFileUnlock(int lockId);
 
 // Appends to a list the names, without the directory, of the directory's entries that begin with
-// `prefix`, in ascending order by byte value. `flags` is always 130: entries that are regular
-// files, or links to one. A name that begins with a dot is never listed. Returns the number of
-// names, negative on failure with the list as it was.
+// `prefix`, in ascending order by byte value. `flags` is platform::kEnumRegularFiles. A name that
+// begins with a dot is never listed. Returns the number of names, negative on failure with the list
+// as it was.
 int ALIBCFileEnumDir(const char* dir, const char* prefix, ALIBSZLIST** names, int flags);
 
 // Gives what stat() tells of a path. `flags` is always 1: links are followed.

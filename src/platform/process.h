@@ -13,10 +13,17 @@
 
 #include <cstdio>
 
+namespace platform {
+
+// The `flags` of every fork and of every program that is run with them.
+constexpr int kRunFlags = 187;
+
+}  // namespace platform
+
 extern "C" {
 
 // Forks as fork() does: 0 in the child, the child's id in the parent, negative on failure. `flags`
-// is always 187.
+// is platform::kRunFlags.
 int ALIBCProcForkEx(int flags);
 
 // Runs a program with up to four arguments, of which the first null one ends the list, and waits
@@ -24,7 +31,7 @@ int ALIBCProcForkEx(int flags);
 int ALIBCExec(const char* program, const char* a1, const char* a2, const char* a3, const char* a4);
 
 // Runs a program with the arguments that follow, up to a null one, and waits for it. `flags` is
-// always 187. Returns its status.
+// platform::kRunFlags. Returns its status.
 int ALIBCExecl(const char* program, int flags, ...);
 
 // Starts a program with the arguments that follow the mode, up to a null one. `mode` is always "r".

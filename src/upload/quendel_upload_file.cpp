@@ -28,7 +28,6 @@ constexpr Json::ArrayIndex kMaxFiles = 5;
 constexpr size_t kMaxPathBytes = 1024;
 
 constexpr char kCollectorTool[] = "/usr/arvo/bin/arvomsg_collector2";
-constexpr int kRunFlags = 0xBB;
 
 bool MatchesDumpPattern(const char* path) {
   regex_t pattern;
@@ -73,7 +72,7 @@ bool MakeDirectory(const char* path) {
 bool MoveCompressedDump(const std::string& compressed) {
   if (ALIBCExec("/bin/mv", compressed.c_str(), kDumpDir, nullptr, nullptr) != 0) {
     QUENDEL_LOG("Fail to move coredump");
-    if (ALIBCExecl("/bin/rm", kRunFlags, "-rf", compressed.c_str(), nullptr) == -1) {
+    if (ALIBCExecl("/bin/rm", platform::kRunFlags, "-rf", compressed.c_str(), nullptr) == -1) {
       QUENDEL_LOG("Fail to remove temp log zip [%s]", compressed.c_str());  // [sic]
     }
     return false;
@@ -112,7 +111,7 @@ bool PrepareDebugArchive(const char*& tempDir, std::string& prepared) {
   }
   prepared = std::string(kDebugDir) + ".zip";
   // Deliberate: this archive lies beside the temporary directory and stays when that is removed.
-  if (ALIBCExecl("/usr/bin/zip", kRunFlags, "-q", "-9", "-UN=UTF8", "-E", "-yf", "-r",
+  if (ALIBCExecl("/usr/bin/zip", platform::kRunFlags, "-q", "-9", "-UN=UTF8", "-E", "-yf", "-r",
                  prepared.c_str(), kDebugDir, nullptr) < 0) {
     QUENDEL_LOG("Fail to zip attachment %s", prepared.c_str());
     return false;
@@ -194,7 +193,7 @@ void RemoveTempDir(const char* tempDir) {
   if (*tempDir == '\0') {
     return;
   }
-  if (ALIBCExecl("/bin/rm", kRunFlags, "-rf", tempDir, nullptr) == -1) {
+  if (ALIBCExecl("/bin/rm", platform::kRunFlags, "-rf", tempDir, nullptr) == -1) {
     QUENDEL_LOG("Fail to remove temp logs [%s]", tempDir);
   }
 }

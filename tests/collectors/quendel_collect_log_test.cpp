@@ -693,7 +693,7 @@ TEST(CollectLogTest, FailsWhenTheSnapshotCannotBeAppended) {
   const std::string conf = SpoilAppending([] {
     const auto onceThereIsASnapshot = [](size_t&) {
       errno = ENOSPC;
-      return !Exists(kOutput + ".tmp");
+      return !Exists(kOutput + ".tmp") || fs::is_empty(kOutput + ".tmp");
     };
     OnFileCalls().copy_file_range = onceThereIsASnapshot;
     OnFileCalls().sendfile = onceThereIsASnapshot;

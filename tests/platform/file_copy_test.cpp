@@ -2,6 +2,7 @@
 #include <fcntl.h>
 #include <gmock/gmock.h>
 #include <sys/mount.h>
+#include <sys/sendfile.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -23,8 +24,9 @@ QUENDEL_FAILING_CALL(ssize_t, copy_file_range,
 QUENDEL_FAILING_CALL(off_t, lseek, (int fd, off_t place, int from), fd, place, from)
 QUENDEL_FAILING_CALL(ssize_t, pread, (int fd, void* buf, size_t size, off_t place), fd, buf, size,
                      place)
-QUENDEL_FAILING_CALL(ssize_t, pwrite, (int fd, const void* buf, size_t size, off_t place), fd, buf,
-                     size, place)
+QUENDEL_FAILING_CALL(ssize_t, sendfile, (int to, int from, off_t* place, size_t size), to, from,
+                     place, size)
+QUENDEL_FAILING_CALL(ssize_t, write, (int fd, const void* buf, size_t size), fd, buf, size)
 
 namespace {
 
@@ -165,12 +167,14 @@ TEST(FileCopyTest, ReadsAndWritesWhereTheKernelCannotCopy) {
   const std::string bytes = RandomBytes(700000);
   WriteFile(kFrom, bytes);
   for (const int reason : {EXDEV, EINVAL, ENOSYS, EOPNOTSUPP, EPERM, EIO, EINTR}) {
-    copy_file_rangeCalls.Fail(1, -1, reason);
+    copy_file_rangeCalls.Fail(0, -1, reason == EINTR ? EXDEV : reason);
+    sendfileCalls.Fail(reason == EINTR ? 1 : 0, -1, reason);
     EXPECT_EQ(Copy(), 0);
     EXPECT_TRUE(ReadFile(kTo) == bytes) << reason;
   }
   // Some file systems tell nothing but that they copied nothing.
-  copy_file_rangeCalls.Fail(1, 0);
+  copy_file_rangeCalls.Fail(0, 0);
+  sendfileCalls.Fail(0, 0);
   EXPECT_EQ(Copy(), 0);
   EXPECT_TRUE(ReadFile(kTo) == bytes);
 }
@@ -185,9 +189,13 @@ TEST(FileCopyTest, CopiesInTheKernelWhereItCan) {
 TEST(FileCopyTest, IsNotDisturbedBySignals) {
   const std::string bytes = RandomBytes(700000);
   WriteFile(kFrom, bytes);
-  copy_file_rangeCalls.Fail(1, -1, EXDEV);
+  copy_file_rangeCalls.Fail(1, -1, EINTR);
+  EXPECT_EQ(Copy(), 0);
+  EXPECT_TRUE(ReadFile(kTo) == bytes);
+  copy_file_rangeCalls.Fail(0, -1, EXDEV);
+  sendfileCalls.Fail(0, -1, EINVAL);
   preadCalls.Fail(2, -1, EINTR);
-  pwriteCalls.Fail(2, -1, EINTR);
+  writeCalls.Fail(2, -1, EINTR);
   EXPECT_EQ(Copy(), 0);
   EXPECT_TRUE(ReadFile(kTo) == bytes);
 }
@@ -202,8 +210,9 @@ TEST(FileCopyTest, CopiesWhereTheFileSystemKnowsNoHoles) {
 
 TEST(FileCopyTest, EndsWhereASourceThatShrankEnds) {
   WriteFile(kFrom, RandomBytes(700000));
-  lseekCalls.Fail(0, -1, EINVAL);
-  copy_file_rangeCalls.Fail(1, -1, EXDEV);
+  lseekCalls.Fail(1, -1, EINVAL);
+  copy_file_rangeCalls.Fail(0, -1, EXDEV);
+  sendfileCalls.Fail(0, -1, EINVAL);
   preadCalls.Fail(1, 0);  // the end, earlier than the size told
   EXPECT_EQ(Copy(), 0);
   EXPECT_EQ(StatusOf(kTo).st_size, 0);

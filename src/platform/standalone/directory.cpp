@@ -19,7 +19,6 @@
 namespace platform {
 namespace {
 
-constexpr int kEnumRegularFiles = 130;
 constexpr mode_t kPrivateMode = 0700;
 constexpr unsigned int kModeBits = 07777;
 
@@ -69,38 +68,38 @@ bool ListFiles(const char* dir, const char* prefix, std::vector<std::string>& na
 }
 
 // Nobody but us can use a directory before it has its owner and mode.
-Descriptor CreateDirectory(int parent, const char* name, const Ownership& ownership) {
+OwnedFd CreateDirectory(int parent, const char* name, const Ownership& ownership) {
   if (mkdirat(parent, name, kPrivateMode) != 0) {
-    return Descriptor();
+    return OwnedFd();
   }
-  Descriptor created(openat(parent, name, O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+  OwnedFd created(openat(parent, name, O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
   constexpr auto kKeep = static_cast<unsigned int>(-1);
   const bool changesOwner = ownership.uid != kKeep || ownership.gid != kKeep;
   if (created && changesOwner && fchown(created.get(), ownership.uid, ownership.gid) != 0) {
-    return Descriptor();
+    return OwnedFd();
   }
   if (created && fchmod(created.get(), ownership.mode) != 0) {
-    return Descriptor();
+    return OwnedFd();
   }
   return created;
 }
 
 // Returns a descriptor that is false with errno set when the directory is neither there nor made.
-Descriptor EnterOrCreate(int parent, const char* name, const Ownership& ownership) {
+OwnedFd EnterOrCreate(int parent, const char* name, const Ownership& ownership) {
   constexpr int kEnter = O_PATH | O_DIRECTORY | O_CLOEXEC;
-  Descriptor entered(openat(parent, name, kEnter));
+  OwnedFd entered(openat(parent, name, kEnter));
   if (entered || errno != ENOENT) {
     return entered;
   }
-  Descriptor created = CreateDirectory(parent, name, ownership);
+  OwnedFd created = CreateDirectory(parent, name, ownership);
   if (created || errno != EEXIST) {
     return created;
   }
-  return Descriptor(openat(parent, name, kEnter));  // somebody else was faster
+  return OwnedFd(openat(parent, name, kEnter));  // somebody else was faster
 }
 
 int MakePath(const std::string& path, const Ownership& ownership) {
-  Descriptor current(open(path[0] == '/' ? "/" : ".", O_PATH | O_DIRECTORY | O_CLOEXEC));
+  OwnedFd current(open(path[0] == '/' ? "/" : ".", O_PATH | O_DIRECTORY | O_CLOEXEC));
   for (size_t begin = 0; current && begin < path.size();) {
     const size_t end = std::min(path.find('/', begin), path.size());
     if (end > begin) {

@@ -65,7 +65,7 @@ int ALIBCFileTouch(const char* path) {
     return platform::Fail(platform::kErrorWriteFailed);
   }
   constexpr int kCreate = O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC;
-  const platform::Descriptor created(open(path, kCreate, platform::kTouchedFileMode));
+  const platform::OwnedFd created(open(path, kCreate, platform::kTouchedFileMode));
   // Somebody else may have created it meanwhile; what is there is a link to nothing otherwise.
   const bool isThere = created || (errno == EEXIST && utimensat(AT_FDCWD, path, nullptr, 0) == 0);
   return isThere ? 0 : platform::Fail(platform::kErrorWriteFailed);

@@ -169,10 +169,10 @@ FILE* OpenStream(const std::vector<char*>& argv) {
     Fail(kErrorNotStarted);
     return nullptr;
   }
-  // Whatever this process has closed, the end that the child writes to is never 0, the one stream
-  // that the child opens before it takes that end over: a pipe's read end has the lower number.
-  Descriptor readEnd(ends[0]);
-  const Descriptor writeEnd(ends[1]);
+  // The child opens /dev/null as 0 before it makes the write end its 1, so the write end must not
+  // be 0. It never is, even where this process has closed 0: the read end gets the lower number.
+  OwnedFd readEnd(ends[0]);
+  const OwnedFd writeEnd(ends[1]);
   std::unique_ptr<FILE, void (*)(FILE*)> stream(fdopen(readEnd.get(), "r"), CloseStream);
   if (!stream) {
     Fail(kErrorNoMemory);

@@ -34,16 +34,16 @@ class TreeRemoval {
  public:
   // Removes what is below a directory. Returns 0, or the error number of the first thing that
   // stayed.
-  int Empty(Descriptor top);
+  int Empty(OwnedFd top);
 
  private:
   void Note(int error) { firstError_ = firstError_ == 0 ? error : firstError_; }
-  void Enter(const std::string& name, Descriptor directory);
+  void Enter(const std::string& name, OwnedFd directory);
   void RemoveEntries(Level& level);
   void Leave();
 
   int firstError_ = 0;
-  Descriptor current_;
+  OwnedFd current_;
   std::vector<Level> levels_;
 };
 
@@ -54,7 +54,7 @@ bool IsDotName(const std::string& name) {
 // Returns 0, or an error number with the names that could be read.
 int ReadNames(int directory, std::vector<std::string>& names) {
   // The stream takes a descriptor over, and the directory's own is needed longer.
-  Descriptor copy(openat(directory, ".", kOpenDirectory));
+  OwnedFd copy(openat(directory, ".", kOpenDirectory));
   const std::unique_ptr<DIR, int (*)(DIR*)> stream(copy ? fdopendir(copy.get()) : nullptr,
                                                    closedir);
   if (!stream) {
@@ -92,7 +92,7 @@ void TreeRemoval::RemoveEntries(Level& level) {
   }
 }
 
-void TreeRemoval::Enter(const std::string& name, Descriptor directory) {
+void TreeRemoval::Enter(const std::string& name, OwnedFd directory) {
   if (!directory && errno == ENOENT) {
     return;  // somebody else was faster
   }
@@ -118,7 +118,7 @@ void TreeRemoval::Leave() {
   if (levels_.empty()) {
     return;
   }
-  Descriptor above(openat(current_.get(), "..", kOpenDirectory));
+  OwnedFd above(openat(current_.get(), "..", kOpenDirectory));
   struct stat status;
   const Level& expected = levels_.back();
   if (!above || fstat(above.get(), &status) != 0 || status.st_dev != expected.device ||
@@ -134,7 +134,7 @@ void TreeRemoval::Leave() {
   }
 }
 
-int TreeRemoval::Empty(Descriptor top) {
+int TreeRemoval::Empty(OwnedFd top) {
   Enter(std::string(), std::move(top));
   while (!levels_.empty()) {
     std::vector<std::string>& directories = levels_.back().directories;
@@ -144,7 +144,7 @@ int TreeRemoval::Empty(Descriptor top) {
     }
     const std::string name = std::move(directories.back());
     directories.pop_back();
-    Enter(name, Descriptor(openat(current_.get(), name.c_str(), kOpenDirectory)));
+    Enter(name, OwnedFd(openat(current_.get(), name.c_str(), kOpenDirectory)));
   }
   return firstError_;
 }
@@ -161,7 +161,7 @@ bool HasNameToRemove(const std::string& path) {
 }
 
 int RemoveTree(const std::string& path) {
-  Descriptor top(open(path.c_str(), kOpenDirectory));
+  OwnedFd top(open(path.c_str(), kOpenDirectory));
   if (!top) {
     return Fail(errno == ENOENT || errno == ENOTDIR ? kErrorNotFound : kErrorUnreadable);
   }

@@ -68,17 +68,17 @@ bool WriteNewFile(const std::string& path, const std::string& text, const struct
   if (unlink(path.c_str()) != 0 && errno != ENOENT) {
     return false;
   }
-  Descriptor file(open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, kPrivateMode));
-  if (!file || !WriteAll(file.get(), text) || !TakeOver(file.get(), old) ||
+  OwnedFd file(open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, kPrivateMode));
+  if (!file || !quendel::WriteAll(file.get(), text) || !TakeOver(file.get(), old) ||
       fsync(file.get()) != 0) {
     return false;
   }
-  return close(file.Release()) == 0;
+  return file.Close();
 }
 
 // A file system that cannot synchronise a directory says EINVAL: there is nothing to be done then.
 bool SynchroniseDirectory(const std::string& path) {
-  const Descriptor directory(open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  const OwnedFd directory(open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
   return directory && (fsync(directory.get()) == 0 || errno == EINVAL);
 }
 
@@ -95,7 +95,7 @@ int ReplaceFile(const std::string& path, const std::string& text, const struct s
 
 int ChangeLockedFile(const std::string& path, const Change& change) {
   struct stat old;
-  const Descriptor file = OpenRegularFile(path.c_str(), &old);
+  const OwnedFd file = OpenForReading(path.c_str(), old);
   std::string oldText;
   if (!file || !ReadToEnd(file.get(), old.st_size, oldText)) {
     return -1;
@@ -111,7 +111,7 @@ int ChangeLockedFile(const std::string& path, const Change& change) {
 
 FileLock::FileLock(const std::string& target) : path_(HiddenNameBeside(target, ".lock")) {
   for (;;) {
-    Descriptor file(
+    OwnedFd file(
         open(path_.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK, kPrivateMode));
     if (!file || !WaitForLock(file.get())) {
       Fail(kErrorLockFailed);

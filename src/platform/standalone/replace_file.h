@@ -26,7 +26,7 @@ class FileLock {
 
  private:
   std::string path_;
-  Descriptor file_;
+  OwnedFd file_;
 };
 
 // Makes the new text of a file out of the old one.

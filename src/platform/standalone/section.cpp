@@ -76,8 +76,8 @@ void CloseSection(SectionIndex& index, const OpenSection& section, size_t end) {
   ranges.push_back({section.begin, end});
 }
 
-// Tells whether a line belongs to a section that begins, its count or its name: cut short, it does
-// not hurt the section above.
+// Tells whether a line is one of the two that a section begins with, its count and its name. Where
+// such a line is cut short, the section that was to begin is lost, and the one above is whole.
 bool IsLead(std::string_view line) {
   return !line.empty() && (line.front() == '#' || line.front() == '[');
 }
@@ -127,7 +127,7 @@ const SectionIndex* IndexOf(const char* path) {
   }
   lastIndex.reset();
   auto index = std::make_unique<SectionIndex>();
-  const Descriptor file = OpenRegularFile(path, &index->status);
+  const OwnedFd file = OpenForReading(path, index->status);
   if (!file || !ReadToEnd(file.get(), index->status.st_size, index->text)) {
     return nullptr;
   }
@@ -182,7 +182,7 @@ bool AppendByOneWrite(int fd, off_t oldSize, const std::string& text) {
 
 int AppendLocked(const char* path, const std::string& text) {
   constexpr int kFlags = O_RDWR | O_APPEND | O_CREAT | O_CLOEXEC | O_NONBLOCK | O_NOCTTY;
-  const Descriptor file(open(path, kFlags, kNewFileMode));
+  const OwnedFd file(open(path, kFlags, kNewFileMode));
   struct stat status;
   if (!file || fstat(file.get(), &status) != 0) {
     return Fail(kErrorWriteFailed);
