@@ -31,6 +31,11 @@ inline constexpr char kSupportSshDir[] = "/run/quendelhome/.ssh";
 inline constexpr char kAuthorizedKeysName[] = "authorized_keys";
 inline constexpr char kAuthorizedKeysFile[] = "/run/quendelhome/.ssh/authorized_keys";
 
+// What the programs that run collections agree on: at most one run at a time.
+inline constexpr char kProgramsRunDir[] = "/run/quendel";
+inline constexpr char kCollectLockName[] = "collect.lock";
+inline constexpr char kCollectLockFile[] = "/run/quendel/collect.lock";
+
 }  // namespace quendel
 
 #endif  // BASE_PATHS_H_
