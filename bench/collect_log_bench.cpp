@@ -21,6 +21,7 @@
 
 #include "quendel.h"
 #include "scene.h"
+#include "support/appliance_only.h"
 
 using namespace bench;
 
@@ -349,6 +350,7 @@ class LeastTimes : public benchmark::BenchmarkReporter {
 }  // namespace
 
 int main(int argc, char** argv) {
+  quendel::test::EndUnlessOnAppliance("script/bench");
   if (argc == 2 && argv[1][0] == '/') {
     const bool collected = QUENDELCollectLog(argv[1]) == 0;
     printf("%ld\n", static_cast<long>(PeakKibibytes()));

@@ -17,6 +17,7 @@
 
 #include "quendel.h"
 #include "scene.h"
+#include "support/appliance_only.h"
 
 using namespace bench;
 
@@ -76,6 +77,7 @@ int Collect() {
 }  // namespace
 
 int main(int argc, char** argv) {
+  quendel::test::EndUnlessOnAppliance("script/bench");
   if (argc == 2 && strcmp(argv[1], "--collect") == 0) {
     return Collect();
   }
