@@ -45,6 +45,10 @@ ssize_t MoveByHand(int source, off_t& offset, int64_t count, int sink) {
 
 }  // namespace
 
+bool IsAbsence(int error) {
+  return error == ENOENT || error == ENOTDIR || error == ELOOP || error == ENAMETOOLONG;
+}
+
 OwnedFd OpenRegularFile(const char* path, struct stat& status) {
   OwnedFd file(open(path, O_RDONLY | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
   if (!file || fstat(file.get(), &status) != 0) {

@@ -14,6 +14,10 @@
 
 namespace quendel {
 
+// Tells whether a call that failed with this errno has told that there is nothing at the path. Any
+// other error says nothing about what is there.
+bool IsAbsence(int error);
+
 // Opens a regular file for reading. Anything else is refused, with EISDIR or EINVAL, and never
 // waited for: a FIFO would keep its reader until somebody writes. `status` gets what fstat() tells
 // of the open file. Returns no descriptor on failure.

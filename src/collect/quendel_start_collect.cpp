@@ -308,13 +308,13 @@ void EndChild(const CollectorChild& child) {
 }
 
 void RemoveFile(const char* path) {
-  if (ALIBCFileExist(path) == 1 && remove(path) != 0) {
+  if (ALIBCFileExist(path) != 0 && remove(path) != 0) {
     QUENDEL_LOG("Failed to remove %s [errno=%d]", path, errno);
   }
 }
 
 void RemoveRunDir(const char* path) {
-  if (ALIBCFileCheckDir(path) == 1 && ALIBCopyRemoveDir(path) != 0) {
+  if (ALIBCFileCheckDir(path) != 0 && ALIBCopyRemoveDir(path) != 0) {
     QUENDEL_LOG("Error happened when remove %s, errno:%d [%m]", path, errno);
   }
 }

@@ -67,8 +67,16 @@ bool BuildCopyPath(Path& path, const LogTask& task, int number) {
   return length >= 0 && static_cast<size_t>(length) < sizeof path;
 }
 
+// Tells whether there is nothing at a path. A file that cannot be examined is not missing: its
+// lines would be overwritten or passed over. A platform may tell the two apart or not, so that its
+// "no" counts only when the file system itself says the same.
+bool IsMissing(const char* path) {
+  struct stat status = {};
+  return ALIBCFileExist(path) == 0 && stat(path, &status) != 0 && IsAbsence(errno);
+}
+
 void RemoveIfExists(const char* path) {
-  if (ALIBCFileExist(path) == 1 && remove(path) != 0) {
+  if (ALIBCFileExist(path) != 0 && remove(path) != 0) {
     QUENDEL_LOG("Failed to remove %s [errno=%d]", path, errno);
   }
 }
@@ -189,7 +197,7 @@ bool AppendWholeLog(const char* source, const char* output) {
 // Brings the whole source into the output. `base` receives how much the output held before.
 bool CopyWholeLog(const char* source, const char* output, int64_t& base) {
   base = 0;
-  if (ALIBCFileExist(output) != 1) {
+  if (IsMissing(output)) {
     if (QUENDELFileCopy(source, output) != 0) {
       QUENDEL_LOG("Failed to copy log '%s' to '%s'", source, output);
       return false;
@@ -238,7 +246,7 @@ bool CopyWholeAndStage(const LogTask& task, const char* source, const char* outp
 bool ListArchives(const LogTask& task, OwnedList& inodes) {
   const char* const log = task.record->path;
   Path archive = {};
-  for (int n = 1; BuildArchivePath(archive, log, n) && ALIBCFileExist(archive) == 1; ++n) {
+  for (int n = 1; BuildArchivePath(archive, log, n) && !IsMissing(archive); ++n) {
     struct stat status = {};
     if (ALIBCFileStat(archive, 1, &status) < 0) {
       QUENDEL_LOG("Failed to stat file '%s'", archive);
@@ -386,7 +394,7 @@ LiveResult ContinueLiveLog(const LogTask& task, const char* output, const struct
 LiveResult CollectLiveLog(const LogTask& task) {
   const char* const log = task.record->path;
   // What the archive step staged is dropped with the log that is missing; its archives come again.
-  if (ALIBCFileExist(log) != 1) {
+  if (IsMissing(log)) {
     return LiveResult::kNothingNew;
   }
   struct stat status = {};

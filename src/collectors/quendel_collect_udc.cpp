@@ -194,7 +194,7 @@ int QUENDELCollectUDC(const char* dstDir) try {
     QUENDEL_LOG("Failed to allocate memory for UDC hash");
     return -1;
   }
-  if (ALIBCFileExist(kUdcUpdateFile) == 1 && remove(kUdcUpdateFile) != 0) {
+  if (ALIBCFileExist(kUdcUpdateFile) != 0 && remove(kUdcUpdateFile) != 0) {
     QUENDEL_LOG("Failed to remove %s [errno=%d]", kUdcUpdateFile, errno);
   }
   if (ALIBCFileEnumDir(kCollectorConfDir, "quendel.udc.", names.slot(),

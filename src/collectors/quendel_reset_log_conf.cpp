@@ -30,7 +30,7 @@ constexpr Entry kEntries[] = {
 using namespace quendel;
 
 int QUENDELResetLogConf(const char* path) {
-  if (ALIBCFileExist(path) != 1) {
+  if (ALIBCFileExist(path) == 0) {
     return 0;
   }
   for (const Entry& entry : kEntries) {

@@ -17,7 +17,7 @@ constexpr char kLogUnit[] = "quendel_reset_udc_conf";
 using namespace quendel;
 
 int QUENDELResetUDCConf(const char* path) {
-  if (ALIBCFileExist(path) != 1) {
+  if (ALIBCFileExist(path) == 0) {
     return 0;
   }
   if (ALIBCFileSetKeyValue(path, "last_hash", kResetValue, 0) <= 0) {

@@ -52,7 +52,7 @@ void CommitSection(const char* updateFile, const char* section, platform::OwnedH
 using namespace quendel;
 
 int QUENDELUpdateCollectConf(const char* path) {
-  if (ALIBCFileExist(path) != 1) {
+  if (ALIBCFileExist(path) == 0) {
     return 0;
   }
   platform::OwnedList sections(kSectionListSize);

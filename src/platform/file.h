@@ -14,7 +14,8 @@ constexpr int kEnumRegularFiles = 130;
 
 extern "C" {
 
-// Returns 1 when the path exists, whatever it is, else 0. A link to nothing does not exist.
+// Returns 1 when the path exists, whatever it is; 0 when it does not, as a link to nothing; negative
+// when that cannot be told.
 int ALIBCFileExist(const char* path);
 
 // Returns 1 when the path is a directory, or a link to one; 0 when it is something else or does not

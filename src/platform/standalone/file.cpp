@@ -20,7 +20,13 @@ constexpr mode_t kTouchedFileMode = 0644;
 
 int ALIBCFileExist(const char* path) {
   struct stat status;
-  return path != nullptr && stat(path, &status) == 0 ? 1 : 0;
+  if (path == nullptr) {
+    return 0;
+  }
+  if (stat(path, &status) == 0) {
+    return 1;
+  }
+  return quendel::IsAbsence(errno) ? 0 : platform::Fail(platform::kErrorUnreadable);
 }
 
 int ALIBCFileCheckDir(const char* path) {
@@ -31,10 +37,7 @@ int ALIBCFileCheckDir(const char* path) {
   if (stat(path, &status) == 0) {
     return S_ISDIR(status.st_mode) ? 1 : 0;
   }
-  if (errno == ENOENT || errno == ENOTDIR) {
-    return 0;
-  }
-  return platform::Fail(platform::kErrorUnreadable);
+  return quendel::IsAbsence(errno) ? 0 : platform::Fail(platform::kErrorUnreadable);
 }
 
 // The operations of this platform give every lock back before they return, so there is never one
