@@ -40,16 +40,16 @@ bool MakeSshDir() {
 }
 
 // The support account owns its home, so whoever held it before may have put a link in place of the
-// folder or of the file, to have root write somewhere else. A FIFO would make the open wait for
+// directory or of the file, to have root write somewhere else. A FIFO would make the open wait for
 // ever. What was there is not emptied before it is known.
 int OpenKeyFile() {
-  const int folder = open(kSupportSshDir, O_PATH | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC);
-  if (folder < 0) {
+  const int directory = open(kSupportSshDir, O_PATH | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC);
+  if (directory < 0) {
     return -1;
   }
-  const int file = openat(folder, kAuthorizedKeysName,
+  const int file = openat(directory, kAuthorizedKeysName,
                           O_WRONLY | O_CREAT | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC, 0666);
-  close(folder);
+  close(directory);
   return file;
 }
 
@@ -79,7 +79,8 @@ bool WriteKey(std::FILE* stream, const char* key) {
     QUENDEL_LOG("Failed to update '%s'", kAuthorizedKeysFile);
     return false;
   }
-  if (chmod(kAuthorizedKeysFile, 0644) != 0) {
+  // By the open file: its owner could have put something else in the place of its name by now.
+  if (fchmod(fileno(stream), 0644) != 0) {
     QUENDEL_LOG("Failed to chmod '%s'", kAuthorizedKeysFile);
     return false;
   }

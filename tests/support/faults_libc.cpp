@@ -18,6 +18,7 @@ QUENDEL_WRAP(void*, calloc, (size_t count, size_t size), count, size);
 QUENDEL_WRAP(int, chmod, (const char* path, mode_t mode), path, mode);
 QUENDEL_WRAP(int, chown, (const char* path, uid_t owner, gid_t group), path, owner, group);
 QUENDEL_WRAP(int, connect, (int fd, const sockaddr* address, socklen_t size), fd, address, size);
+QUENDEL_WRAP(int, fchmod, (int file, mode_t mode), file, mode);
 QUENDEL_WRAP(FILE*, fdopen, (int fd, const char* mode), fd, mode);
 QUENDEL_WRAP(FILE*, fopen, (const char* path, const char* mode), path, mode);
 QUENDEL_WRAP(pid_t, fork, ());

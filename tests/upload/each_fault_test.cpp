@@ -108,7 +108,7 @@ void ExpectRowForEachCall(const std::vector<Fault>& table, int (*operation)()) {
   for (const char* function : {"regcomp",
                                "calloc",
                                "chown",
-                               "chmod",
+                               "fchmod",
                                "fdopen",
                                "ALIBCExec",
                                "ALIBCExecl",
@@ -344,7 +344,7 @@ std::vector<Fault> OpenFaults() {
           {"quendel_support_account_user: Failed to open "
            "'/run/quendelhome/.ssh/authorized_keys'"},
           kHomeAndAll),
-      Row("chmod", 1, -1, -1,
+      Row("fchmod", 1, -1, -1,
           {"quendel_support_account_user: Failed to chmod "
            "'/run/quendelhome/.ssh/authorized_keys'"},
           kHomeAndAll),

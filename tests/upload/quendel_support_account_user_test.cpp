@@ -223,12 +223,12 @@ TEST(SupportAccountUserCreateTest, FailsWhenTheKeyCannotBeWritten) {
   EXPECT_EQ(result, -1);
   EXPECT_THAT(Log(), ElementsAre(Logged(
                          kUnit, "Failed to update '/run/quendelhome/.ssh/authorized_keys'")));
-  EXPECT_EQ(Calls("chmod"), 0);
+  EXPECT_EQ(Calls("fchmod"), 0);
 }
 
 TEST(SupportAccountUserCreateTest, FailsWhenTheModeCannotBeSet) {
   umask(0);
-  FailCall("chmod", 1, -1, EROFS);
+  FailCall("fchmod", 1, -1, EROFS);
   EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), -1);
   EXPECT_EQ(Mode(kKeyFile), 0666U);  // as any new file has it
   EXPECT_THAT(
