@@ -73,11 +73,14 @@ QUENDEL_EXPORT int QUENDELCollectPerf(Json::Value& reply);
 QUENDEL_EXPORT int QUENDELParsePerfJson(const char* dir, const Json::Value& series);
 
 // Packs a directory into `archive`, a tar file compressed with xz, as one top-level entry: the last
-// component of `dir`, which ends without a "/". An archive that exists is replaced.
+// component of `dir`, which ends without a "/". Only its owner, the effective user, may read the
+// archive. One that exists is replaced when it is a regular file of his with no other name; a link,
+// or anything else in its place, is a failure and stays as it is.
 //
 // Needs the system's "/bin/tar" and xz.
 //
-// Returns 0, or -1 when tar could not be run or failed; the archive may then be there, incomplete.
+// Returns 0, or -1 when tar could not be run or failed; the archive may then be there, incomplete,
+// but not empty.
 QUENDEL_EXPORT int QUENDELTarCollectData(const char* dir, const char* archive);
 
 // Posts an archive to the server, with its description: file name, device time zone, operating

@@ -1,7 +1,11 @@
 // The packing of a run directory.
+#include <fcntl.h>
 #include <gmock/gmock.h>
+#include <sys/mount.h>
 #include <sys/stat.h>
 #include <unistd.h>
+
+#include <functional>
 
 #include "collect/archive_entries.h"
 #include "quendel.h"
@@ -25,6 +29,12 @@ std::vector<std::string> RunFor(const char* dir) {
   FailCall("ALIBCExecl", 1, 0);
   EXPECT_EQ(QUENDELTarCollectData(dir, kArchive), 0);
   return Recorded();
+}
+
+mode_t ModeOf(const char* path) {
+  struct stat status = {};
+  EXPECT_EQ(lstat(path, &status), 0) << path;
+  return status.st_mode;
 }
 
 void ExpectFailure(const std::string& dir, const char* archive = kArchive) {
@@ -99,6 +109,97 @@ TEST(TarCollectDataTest, FailsWhenTheArchiveCannotBeMade) {
 
 TEST(TarCollectDataTest, FailsWhenTheDiskIsFull) {
   WriteFile("/tmp/a/b/f", "1");
-  ASSERT_EQ(symlink("/dev/full", kArchive), 0);
+  ASSERT_EQ(mkdir("/tmp/full", 0700), 0);
+  ASSERT_EQ(mount("tmpfs", "/tmp/full", "tmpfs", 0, "size=4k"), 0);
+  WriteFile("/tmp/full/f", std::string(4096, 'x'));
+  ExpectFailure("/tmp/a/b", "/tmp/full/out.tar.xz");
+  EXPECT_FALSE(Exists("/tmp/full/out.tar.xz"));
+}
+
+// ---- Who may read the archive, and what may lie in its place.
+
+TEST(TarCollectDataTest, MakesTheArchiveForItsOwnerOnly) {
+  umask(0);
+  WriteFile("/tmp/a/b/f", "1");
+  EXPECT_EQ(QUENDELTarCollectData("/tmp/a/b", kArchive), 0);
+  EXPECT_EQ(ModeOf(kArchive), S_IFREG | 0600U);
+}
+
+TEST(TarCollectDataTest, MakesItsFileBeforeItRunsTar) {
+  WriteFile("/tmp/bin/tar", "#!/bin/sh\nstat -c '%a %s' \"$4\" >/tmp/seen\n");
+  ASSERT_EQ(chmod("/tmp/bin/tar", 0755), 0);
+  ASSERT_EQ(mount("/tmp/bin/tar", "/bin/tar", nullptr, MS_BIND, nullptr), 0);
+  umask(0);
+  EXPECT_EQ(QUENDELTarCollectData("/tmp/a/b", kArchive), 0);
+  EXPECT_EQ(ReadFile("/tmp/seen"), "600 0\n");
+}
+
+TEST(TarCollectDataTest, ClosesAnOlderArchiveToOthers) {
+  WriteFile(kArchive, "old");
+  ASSERT_EQ(chmod(kArchive, 0644), 0);
+  WriteFile("/tmp/a/b/f", "1");
+  EXPECT_EQ(QUENDELTarCollectData("/tmp/a/b", kArchive), 0);
+  EXPECT_EQ(ModeOf(kArchive), S_IFREG | 0600U);
+}
+
+TEST(TarCollectDataTest, RemovesAnEmptyArchiveAgain) {
+  for (const long status : {-1, 2}) {
+    FailCall("ALIBCExecl", 1, status);
+    ClearLog();
+    ExpectFailure("/tmp/a/b");
+    EXPECT_FALSE(Exists(kArchive)) << status;
+  }
+}
+
+TEST(TarCollectDataTest, KeepsWhatTarWroteBeforeItFailed) {
+  WriteFile("/tmp/a/b/f", "1");
+  WriteFile("/tmp/bin/tar", "#!/bin/sh\necho half >\"$4\"\nexit 2\n");
+  ASSERT_EQ(chmod("/tmp/bin/tar", 0755), 0);
+  ASSERT_EQ(mount("/tmp/bin/tar", "/bin/tar", nullptr, MS_BIND, nullptr), 0);
   ExpectFailure("/tmp/a/b");
+  EXPECT_EQ(ReadFile(kArchive), "half\n");
+}
+
+TEST(TarCollectDataTest, KeepsAnOlderArchiveWhenTarCannotBeRun) {
+  WriteFile(kArchive, "");
+  FailCall("ALIBCExecl", 1, -1);
+  ExpectFailure("/tmp/a/b");
+  EXPECT_TRUE(Exists(kArchive));
+}
+
+// The file that the link or the second name leads to is somebody's secret.
+TEST(TarCollectDataTest, RefusesWhatIsNoFileOfItsOwn) {
+  WriteFile("/tmp/a/b/f", "1");
+  const std::vector<std::function<int()>> plants = {
+      [] { return symlink("/tmp/secret", kArchive); },
+      [] { return symlink("/tmp/none", kArchive); },
+      [] { return link("/tmp/secret", kArchive); },
+      [] { return mkfifo(kArchive, 0666); },
+      [] { return mkdir(kArchive, 0777); },
+      [] {
+        WriteFile(kArchive, "");
+        return chown(kArchive, 1234, 1234);
+      },
+  };
+  for (size_t i = 0; i < plants.size(); ++i) {
+    RemoveFile(kArchive);
+    WriteFile("/tmp/secret", "secret");
+    ASSERT_EQ(plants[i](), 0);
+    ResetCalls();
+    ClearLog();
+    ExpectFailure("/tmp/a/b");
+    EXPECT_EQ(Calls("ALIBCExecl"), 0) << i;
+    EXPECT_TRUE(Exists(kArchive)) << i;
+    EXPECT_EQ(ReadFile("/tmp/secret"), "secret") << i;
+    EXPECT_FALSE(Exists("/tmp/none")) << i;
+  }
+}
+
+TEST(TarCollectDataTest, WaitsForNobodyWhoReadsAFifoInItsPlace) {
+  ASSERT_EQ(mkfifo(kArchive, 0666), 0);
+  const int reader = open(kArchive, O_RDONLY | O_NONBLOCK);
+  ASSERT_GE(reader, 0);
+  ExpectFailure("/tmp/a/b");
+  EXPECT_EQ(Calls("ALIBCExecl"), 0);
+  close(reader);
 }
