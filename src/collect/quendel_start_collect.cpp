@@ -314,7 +314,7 @@ void RemoveFile(const char* path) {
 }
 
 void RemoveRunDir(const char* path) {
-  if (ALIBCFileCheckDir(path) != 0 && ALIBCopyRemoveDir(path) != 0) {
+  if (ALIBCFileCheckDir(path) == 1 && ALIBCopyRemoveDir(path) != 0) {
     QUENDEL_LOG("Error happened when remove %s, errno:%d [%m]", path, errno);
   }
 }

