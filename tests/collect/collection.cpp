@@ -10,19 +10,13 @@
 #include <filesystem>
 
 #include "support/appliance.h"
-#include "support/faults.h"
+#include "support/calls.h"
 #include "support/require.h"
 
 namespace quendel::test {
-namespace {
-
-std::map<std::string, std::function<int(const char*)>> replaced;
-
-}  // namespace
-
 void StopTheClock() {
   Require(setenv("TZ", "UTC", 1) == 0, "no memory");
-  FailCall("time", 0, kStart);
+  SetClock(kStart);
 }
 
 void InstallCollectors(const std::string& raid) {
@@ -58,8 +52,8 @@ Json::Value PerfSeries() {
   return series;
 }
 
-void ReplaceCollector(const std::string& kind, std::function<int(const char*)> work) {
-  replaced[kind] = std::move(work);
+const char* CollectorOf(const std::string& kind) {
+  return kind == "udc" ? "QUENDELCollectUDC" : "QUENDELCollectLog";
 }
 
 int Hang(const char* /*directory*/) {
@@ -164,23 +158,3 @@ Ending InAGroupOfItsOwn(const std::function<int()>& work) {
 }
 
 }  // namespace quendel::test
-
-// The calls that a run's children make of their collectors pass through these.
-extern "C" {
-// NOLINTBEGIN(bugprone-reserved-identifier)
-int __real__Z17QUENDELCollectLogPKc(const char* directory);
-int __real__Z17QUENDELCollectUDCPKc(const char* directory);
-
-int __wrap__Z17QUENDELCollectLogPKc(const char* directory) {
-  const auto found = quendel::test::replaced.find("log");
-  return found != quendel::test::replaced.end() ? found->second(directory)
-                                                : __real__Z17QUENDELCollectLogPKc(directory);
-}
-
-int __wrap__Z17QUENDELCollectUDCPKc(const char* directory) {
-  const auto found = quendel::test::replaced.find("udc");
-  return found != quendel::test::replaced.end() ? found->second(directory)
-                                                : __real__Z17QUENDELCollectUDCPKc(directory);
-}
-// NOLINTEND(bugprone-reserved-identifier)
-}

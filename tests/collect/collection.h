@@ -31,11 +31,11 @@ std::map<std::string, std::string> CollectorConf();
 // A series of one performance sample.
 Json::Value PerfSeries();
 
-// Makes the child of this kind ("udc" or "log") do this instead of collecting.
-void ReplaceCollector(const std::string& kind, std::function<int(const char*)> work);
+// The call that a child of this kind ("udc" or "log") makes.
+const char* CollectorOf(const std::string& kind);
 
-// Collectors for that: one that never ends, one that does nothing, one that ends when there is a
-// file "/tmp/end", one that dies.
+// What a child can do instead: one that never ends, one that does nothing, one that ends when there
+// is a file "/tmp/end", one that dies.
 int Hang(const char* directory);
 int DoNothing(const char* directory);
 int EndWhenTold(const char* directory);

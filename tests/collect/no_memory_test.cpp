@@ -9,7 +9,7 @@
 #include "collect/collection.h"
 #include "quendel.h"
 #include "support/appliance.h"
-#include "support/faults.h"
+#include "support/calls.h"
 #include "support/json.h"
 #include "support/log.h"
 #include "support/scarce_memory.h"
@@ -117,7 +117,7 @@ TEST(NoMemoryTest, LosesNothingInACollectionRun) {
   for (long nth = 1; nth < 400; nth += 1 + nth / 10) {
     const Ending ending = InAGroupOfItsOwn([nth] {
       signal(SIGTERM, SIG_IGN);
-      OnSleep(AwaitAnyChild);
+      On("sleep").Before(AwaitAnyChild);
       const Json::Value series = PerfSeries();
       FailAllocation(nth);
       const int result = QUENDELStartCollect(0, 0, series);

@@ -1,8 +1,11 @@
 // The asking of the local performance service.
 #include <gmock/gmock.h>
 
+#include <new>
+
 #include "platform/transmitor.h"
 #include "quendel.h"
+#include "support/calls.h"
 #include "support/json.h"
 #include "support/log.h"
 
@@ -14,20 +17,17 @@ namespace {
 
 constexpr char kUnit[] = "quendel_collect_perf";
 
-// What the service does, when a test stands in for it, and what it was asked.
-struct Script {
-  bool plays = false;
-  int transmit = 0;
-  int get = 0;
-  bool throws = false;
-  std::string reply;
-  Json::Value request;
-} script;
+// Plays a service that gives this answer, with this result.
+void Play(const std::string& answer, int result = 0) {
+  On("Transmitor::Transmit").Return(result);
+  On("Transmitor::GetDataJson").Replace([=](Transmitor*, Json::Value& reply) {
+    reply = JsonOf(answer);
+    return result;
+  });
+}
 
-// Plays a service that gives this answer.
 int CollectFrom(const std::string& answer, Json::Value& reply) {
-  script.plays = true;
-  script.reply = answer;
+  Play(answer);
   return QUENDELCollectPerf(reply);
 }
 
@@ -41,35 +41,6 @@ void ExpectRefused(const std::string& answer) {
 
 }  // namespace
 
-// The library's calls of the service's client pass through these.
-extern "C" {
-// NOLINTBEGIN(bugprone-reserved-identifier)
-int __real__ZN10Transmitor8TransmitERKN4Json5ValueE(Transmitor* self, const Json::Value& request);
-int __real__ZN10Transmitor11GetDataJsonERN4Json5ValueE(Transmitor* self, Json::Value& reply);
-
-int __wrap__ZN10Transmitor8TransmitERKN4Json5ValueE(Transmitor* self, const Json::Value& request) {
-  script.request = request;
-  if (!script.plays) {
-    return __real__ZN10Transmitor8TransmitERKN4Json5ValueE(self, request);
-  }
-  return script.transmit;
-}
-
-int __wrap__ZN10Transmitor11GetDataJsonERN4Json5ValueE(Transmitor* self, Json::Value& reply) {
-  if (!script.plays) {
-    return __real__ZN10Transmitor11GetDataJsonERN4Json5ValueE(self, reply);
-  }
-  if (script.throws) {
-    throw std::bad_alloc();
-  }
-  if (script.get >= 0) {
-    reply = JsonOf(script.reply);
-  }
-  return script.get;
-}
-// NOLINTEND(bugprone-reserved-identifier)
-}
-
 TEST(CollectPerfTest, GetsTheFiguresOfThisDevice) {
   Json::Value reply;
   EXPECT_EQ(QUENDELCollectPerf(reply), 0);
@@ -79,9 +50,10 @@ TEST(CollectPerfTest, GetsTheFiguresOfThisDevice) {
 }
 
 TEST(CollectPerfTest, AsksForTheCurrentFigures) {
+  Record("Transmitor::Transmit");
   Json::Value reply;
   EXPECT_EQ(CollectFrom(R"({"success":true,"data":{}})", reply), 0);
-  EXPECT_EQ(script.request, JsonOf(R"({"request":"curr"})"));
+  EXPECT_THAT(Recorded(), ElementsAre(R"({"request":"curr"})"));
 }
 
 TEST(CollectPerfTest, HandsTheAnswerOnWhole) {
@@ -92,26 +64,27 @@ TEST(CollectPerfTest, HandsTheAnswerOnWhole) {
 }
 
 TEST(CollectPerfTest, FailsWhenTheRequestCannotBeSent) {
-  script.transmit = -1;
+  Play(R"({"success":true,"data":{}})");
+  On("Transmitor::Transmit").Return(-1);
   Json::Value reply = "before";
-  EXPECT_EQ(CollectFrom(R"({"success":true,"data":{}})", reply), -1);
+  EXPECT_EQ(QUENDELCollectPerf(reply), -1);
   EXPECT_EQ(reply, "before");
   EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to send perf request")));
 }
 
 TEST(CollectPerfTest, FailsWhenThereIsNoAnswer) {
-  script.get = -1;
+  Play(R"({"success":true,"data":{}})");
+  On("Transmitor::GetDataJson").Return(-1);
   Json::Value reply = "before";
-  EXPECT_EQ(CollectFrom(R"({"success":true,"data":{}})", reply), -1);
+  EXPECT_EQ(QUENDELCollectPerf(reply), -1);
   EXPECT_EQ(reply, "before");
   EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to get perf json reply")));
 }
 
 TEST(CollectPerfTest, TakesPositiveResultsOfTheServiceForSuccess) {
-  script.transmit = 1;
-  script.get = 1;
+  Play(R"({"success":true,"data":{}})", 1);
   Json::Value reply;
-  EXPECT_EQ(CollectFrom(R"({"success":true,"data":{}})", reply), 0);
+  EXPECT_EQ(QUENDELCollectPerf(reply), 0);
 }
 
 TEST(CollectPerfTest, FailsOnAnAnswerWithoutSuccess) {
@@ -133,8 +106,11 @@ TEST(CollectPerfTest, FailsOnAnAnswerThatIsNoObject) {
 }
 
 TEST(CollectPerfTest, FailsWhenMemoryRunsOut) {
-  script.throws = true;
+  Play("null");
+  On("Transmitor::GetDataJson").Replace([](Transmitor*, Json::Value&) -> int {
+    throw std::bad_alloc();
+  });
   Json::Value reply;
-  EXPECT_EQ(CollectFrom("null", reply), -1);
+  EXPECT_EQ(QUENDELCollectPerf(reply), -1);
   EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to get perf data")));
 }

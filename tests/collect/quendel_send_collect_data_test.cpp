@@ -6,7 +6,7 @@
 #include "platform/zone.h"
 #include "quendel.h"
 #include "support/appliance.h"
-#include "support/faults.h"
+#include "support/calls.h"
 #include "support/json.h"
 #include "support/log.h"
 #include "support/server.h"
@@ -98,7 +98,7 @@ TEST(SendCollectDataTest, WritesTheTimestampAsAnUnsignedNumber) {
 }
 
 TEST(SendCollectDataTest, FailsWithoutMemoryBeforeAnythingElse) {
-  FailCall("calloc", 1, 0);
+  On("calloc").Nth(1).Return(nullptr);
   EXPECT_EQ(Send(), -1);
   EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to malloc for pMyhubAccount")));
   EXPECT_EQ(Calls("ARVOMYHUBAccountGet"), 0);
@@ -119,21 +119,21 @@ TEST(SendCollectDataTest, FailsWithoutASerialNumber) {
 }
 
 TEST(SendCollectDataTest, SendsUndescribedWithoutATimeZone) {
-  FailCall("ARVOZoneGet", 1, -1);
+  On("ARVOZoneGet").Nth(1).Return(-1);
   ExpectSentUndescribed();
   EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to get timezone"), NotDescribed()));
   EXPECT_EQ(Calls("ARVOZoneDesc"), 0);
 }
 
 TEST(SendCollectDataTest, SendsUndescribedWhenTheTimeZoneHasNoDescription) {
-  FailCall("ARVOZoneDesc", 1, -1);
+  On("ARVOZoneDesc").Nth(1).Return(-1);
   ExpectSentUndescribed();
   EXPECT_THAT(Log(),
               ElementsAre(Logged(kUnit, "Failed to get timezone description"), NotDescribed()));
 }
 
 TEST(SendCollectDataTest, SendsUndescribedWithoutAVersion) {
-  FailCall("ALIBCSzHashAlloc", 1, 0);
+  On("ALIBCSzHashAlloc").Nth(1).Return(nullptr);
   ExpectSentUndescribed();
   EXPECT_THAT(Log(), ElementsAre(Logged("quendel_device_facts", _),
                                  Logged(kUnit, "Failed to get HMX version"), NotDescribed()));

@@ -10,7 +10,7 @@
 #include <functional>
 
 #include "quendel.h"
-#include "support/faults.h"
+#include "support/calls.h"
 #include "support/log.h"
 
 using namespace quendel::test;
@@ -95,7 +95,7 @@ char FirstByte() {
 
 // Runs an action when this process would have slept for so many seconds.
 void AtSecond(int second, const std::function<void()>& action) {
-  OnSleep([second, action] {
+  On("sleep").Before([second, action] {
     if (SleptSeconds() == second) {
       action();
     }
@@ -144,7 +144,7 @@ TEST(ShmAllocTest, StaysAttachedUntilTheProcessEnds) {
 }
 
 TEST(ShmAllocTest, FailsWhenTheSegmentCannotBeMade) {
-  FailCall("shmget", 1, -1, ENOSPC);
+  On("shmget").Nth(1).Return(-1, ENOSPC);
   EXPECT_EQ(QUENDELShmAlloc(kSize, kKey), -1);
   EXPECT_THAT(Log(), ElementsAre(Logged(kUnit,
                                         "Failed to create the segment, errno: No space left "
@@ -160,7 +160,7 @@ TEST(ShmAllocTest, FailsForALargerSegmentThanTheOneThatIsThere) {
 }
 
 TEST(ShmAllocTest, FailsWhenTheSegmentCannotBeAttached) {
-  FailCall("shmat", 1, -1, EMFILE);
+  On("shmat").Nth(1).Return(-1, EMFILE);
   EXPECT_EQ(QUENDELShmAlloc(kSize, kKey), -1);
   EXPECT_THAT(Log(), ElementsAre(Logged(kUnit,
                                         "Failed to attach the segment to data space, errno: "
@@ -269,7 +269,7 @@ TEST(ShmSendTest, FindsNoSegmentAndDoesNotWait) {
 TEST(ShmSendTest, FailsWhenTheSegmentCannotBeAttached) {
   ASSERT_EQ(QUENDELShmAlloc(kSize, kKey), 0);
   ResetCalls();
-  FailCall("shmat", 1, -1, EACCES);
+  On("shmat").Nth(1).Return(-1, EACCES);
   EXPECT_EQ(Send(Block('a')), -1);
   EXPECT_THAT(Log(), ElementsAre(Logged(kUnit,
                                         "Failed to attach the segment to data space, errno: "
@@ -323,7 +323,7 @@ TEST(ShmReceiveTest, FindsNoSegmentAndDoesNotWait) {
 TEST(ShmReceiveTest, RemovesASegmentThatCannotBeAttached) {
   ASSERT_EQ(QUENDELShmAlloc(kSize, kKey), 0);
   ResetCalls();
-  FailCall("shmat", 1, -1, EACCES);
+  On("shmat").Nth(1).Return(-1, EACCES);
   std::string block(kSize, '#');
   EXPECT_EQ(Receive(block), -1);
   EXPECT_THAT(Log(), ElementsAre(Logged(kUnit,
@@ -378,7 +378,7 @@ TEST(ShmReceiveTest, TriesUntilTheSegmentIsRemoved) {
   ResetCalls();
   constexpr int kFailures = 50;
   for (int i = 1; i <= kFailures; ++i) {
-    FailCall("shmctl", i, -1, EPERM);
+    On("shmctl").Nth(i).Return(-1, EPERM);
   }
   std::string block(kSize, '#');
   EXPECT_EQ(Receive(block), 0);

@@ -8,7 +8,7 @@
 #include "collect/collection.h"
 #include "quendel.h"
 #include "support/appliance.h"
-#include "support/faults.h"
+#include "support/calls.h"
 #include "support/json.h"
 #include "support/log.h"
 #include "support/server.h"
@@ -32,7 +32,7 @@ testing::Matcher<LogLine> FailedToSend() {
 
 int CollectAndSend(int removeAfter) {
   StopTheClock();
-  OnSleep(AwaitAnyChild);
+  On("sleep").Before(AwaitAnyChild);
   return QUENDELStartCollect(removeAfter, 1, PerfSeries());
 }
 
@@ -137,7 +137,7 @@ TEST(StartCollectAndSendTest, CommitsNothingWithoutAnAccount) {
 TEST(StartCollectAndSendTest, SendsEvenWhenTheStateCannotBeCommitted) {
   SetIdentity();
   InstallCollectors();
-  FailCall("ALIBCFileEnumSection", 1, -1);
+  On("ALIBCFileEnumSection").Nth(1).Return(-1);
   EXPECT_EQ(CollectAndSend(1), -1);
   EXPECT_THAT(Requests(), SizeIs(1));
   EXPECT_THAT(Log(), Contains(Logged(kUnit, "Failed to update log config")));

@@ -18,7 +18,7 @@
 #include "collect/collector_child.h"
 #include "quendel.h"
 #include "support/appliance.h"
-#include "support/faults.h"
+#include "support/calls.h"
 #include "support/json.h"
 #include "support/log.h"
 
@@ -46,7 +46,7 @@ testing::Matcher<LogLine> NothingToWaitFor(const std::string& kind) {
 
 // Runs a collection that is not sent. Its children get the time they need.
 int Collect(int removeAfter = 0) {
-  OnSleep(AwaitAnyChild);
+  On("sleep").Before(AwaitAnyChild);
   return QUENDELStartCollect(removeAfter, 0, PerfSeries());
 }
 
@@ -188,7 +188,7 @@ TEST(StartCollectTest, MakesItsDirectoriesForTheOwnerOnly) {
 }
 
 TEST(StartCollectTest, MakesTheWorkRootWhenItCannotBeTold) {
-  FailCall("ALIBCFileCheckDir", 1, -1);
+  On("ALIBCFileCheckDir").Nth(1).Return(-1);
   EXPECT_EQ(Collect(), 0);
   EXPECT_EQ(ModeOf(quendel::kWorkRoot), S_IFDIR | 0700U);
   EXPECT_THAT(Log(), IsEmpty());
@@ -206,7 +206,7 @@ TEST(StartCollectTest, ReusesARunDirectoryThatIsThere) {
   StopTheClock();
   InstallCollectors();
   WriteFile(std::string(kRunDir) + "/log/of-before", "1");
-  FailCall("ALIBCFileCheckDir", 2, 0);  // asked whether the name is taken
+  On("ALIBCFileCheckDir").Nth(2).Return(0);  // asked whether the name is taken
   EXPECT_EQ(Collect(), 0);
   const auto entries = ArchiveEntries(kArchive);
   EXPECT_EQ(entries.at(std::string(kRunName) + "/log/of-before"), "1");
@@ -222,7 +222,7 @@ TEST(StartCollectTest, TakesTheNextNameWhenOneIsTaken) {
 
 TEST(StartCollectTest, LeavesItToTheDirectoryWhetherTheNameIsFree) {
   StopTheClock();
-  FailCall("ALIBCFileCheckDir", 2, -1);
+  On("ALIBCFileCheckDir").Nth(2).Return(-1);
   EXPECT_EQ(Collect(), 0);
   EXPECT_TRUE(Exists(kArchive));
   EXPECT_THAT(Log(), IsEmpty());
@@ -243,9 +243,9 @@ TEST(StartCollectTest, TakesAnyNonZeroNumberForYes) {
 
 TEST(StartCollectTest, ForksTheUdcChildAndThenTheLogChild) {
   Record("ALIBCProcForkEx");
-  OnSleep([] { EXPECT_LT(ChildOf("udc"), ChildOf("log")); });
-  ReplaceCollector("udc", Hang);
-  ReplaceCollector("log", Hang);
+  On("sleep").Before([] { EXPECT_LT(ChildOf("udc"), ChildOf("log")); });
+  On("QUENDELCollectUDC").Replace(Hang);
+  On("QUENDELCollectLog").Replace(Hang);
   WaitLimit("1");
   EXPECT_EQ(QUENDELStartCollect(1, 0, PerfSeries()), -1);
   EXPECT_THAT(Recorded(), ElementsAre("187", "187"));
@@ -253,7 +253,7 @@ TEST(StartCollectTest, ForksTheUdcChildAndThenTheLogChild) {
 
 TEST(StartCollectTest, MarksItsChildrenWhileTheyRun) {
   int seen = 0;
-  OnSleep([&] {
+  On("sleep").Before([&] {
     for (const char* kind : {"udc", "log"}) {
       const std::string marker =
           "/tmp/quendel/" + std::string(kind) + ".p." + std::to_string(ChildOf(kind));
@@ -262,8 +262,8 @@ TEST(StartCollectTest, MarksItsChildrenWhileTheyRun) {
     }
     ++seen;
   });
-  ReplaceCollector("udc", Hang);
-  ReplaceCollector("log", Hang);
+  On("QUENDELCollectUDC").Replace(Hang);
+  On("QUENDELCollectLog").Replace(Hang);
   WaitLimit("1");
   EXPECT_EQ(QUENDELStartCollect(1, 0, PerfSeries()), -1);
   EXPECT_EQ(seen, 1);
@@ -272,7 +272,7 @@ TEST(StartCollectTest, MarksItsChildrenWhileTheyRun) {
 
 TEST(StartCollectTest, GoesOnWithoutAMarker) {
   InstallCollectors();
-  FailCall("ALIBCFileTouch", 0, -1);
+  On("ALIBCFileTouch").Return(-1);
   EXPECT_EQ(Collect(), 0);
   EXPECT_THAT(Log(),
               ElementsAre(Logged(kUnit, StartsWith("Failed to touch file '/tmp/quendel/udc.p.")),
@@ -280,9 +280,9 @@ TEST(StartCollectTest, GoesOnWithoutAMarker) {
 }
 
 TEST(StartCollectTest, TellsWhichMarkerItCannotRemove) {
-  ReplaceCollector("udc", EndWhenTold);
-  ReplaceCollector("log", EndWhenTold);
-  OnSleep([] {
+  On("QUENDELCollectUDC").Replace(EndWhenTold);
+  On("QUENDELCollectLog").Replace(EndWhenTold);
+  On("sleep").Before([] {
     for (const std::string kind : {"udc", "log"}) {
       if (!Exists("/tmp/end")) {
         const std::string marker = "/tmp/quendel/" + kind + ".p." + std::to_string(ChildOf(kind));
@@ -311,10 +311,10 @@ TEST(StartCollectTest, SucceedsWhateverBecomesOfTheCollectors) {
 
 TEST(StartCollectTest, EndsItsChildrenWithStatusZeroWhateverBecameOfThem) {
   for (const char* kind : {"udc", "log"}) {
-    ReplaceCollector(kind, [](const char* directory) { return EndWhenTold(directory) - 1; });
+    On(CollectorOf(kind)).Replace([](const char* directory) { return EndWhenTold(directory) - 1; });
   }
   WaitLimit("1");
-  OnSleep([] {
+  On("sleep").Before([] {
     WriteFile("/tmp/end", "");
     for (const char* kind : {"udc", "log"}) {
       siginfo_t ended = {};
@@ -329,7 +329,7 @@ TEST(StartCollectTest, EndsItsChildrenWithStatusZeroWhateverBecameOfThem) {
 TEST(StartCollectTest, GivesEachCollectorItsDirectory) {
   StopTheClock();
   for (const char* kind : {"udc", "log"}) {
-    ReplaceCollector(kind, [](const char* directory) {
+    On(CollectorOf(kind)).Replace([](const char* directory) {
       WriteFile(std::string(directory) + "/made-by", directory);
       return 0;
     });
@@ -347,7 +347,7 @@ TEST(StartCollectTest, GivesItsChildrenTheDefaultActionForSigterm) {
               signal(SIGTERM, [](int) {});
               MaskSigterm(SIG_BLOCK);
               for (const char* kind : {"udc", "log"}) {
-                ReplaceCollector(kind, [](const char* directory) {
+                On(CollectorOf(kind)).Replace([](const char* directory) {
                   WriteFile(std::string(directory) + "/sigterm", SigtermState());
                   return 0;
                 });
@@ -369,7 +369,7 @@ TEST(StartCollectTest, LeavesTheCallersSigtermUnblocked) {
 
 TEST(StartCollectTest, GoesOnWhenAChildCannotSetItsActionForSigterm) {
   StopTheClock();
-  FailCall("signal", 1, -1, EINVAL);
+  On("signal").Nth(1).Return(-1, EINVAL);
   EXPECT_EQ(Collect(), 0);
   EXPECT_THAT(
       Log(),
@@ -380,7 +380,7 @@ TEST(StartCollectTest, GoesOnWhenAChildCannotSetItsActionForSigterm) {
 
 TEST(StartCollectTest, GivesItsChildrenNothingToRead) {
   StopTheClock();
-  ReplaceCollector("udc", [](const char* directory) {
+  On("QUENDELCollectUDC").Replace([](const char* directory) {
     WriteFile(std::string(directory) + "/input", std::filesystem::read_symlink("/proc/self/fd/0"));
     return 0;
   });
@@ -394,7 +394,9 @@ TEST(StartCollectTest, GivesItsChildrenNothingToRead) {
 TEST(StartCollectTest, KeepsAnExceptionInsideTheChild) {
   StopTheClock();
   EXPECT_EQ(InAGroupOfItsOwn([] {
-              ReplaceCollector("log", [](const char*) -> int { throw std::runtime_error("lost"); });
+              On("QUENDELCollectLog").Replace([](const char*) -> int {
+                throw std::runtime_error("lost");
+              });
               try {
                 return Collect();
               } catch (...) {
@@ -420,7 +422,7 @@ TEST(StartCollectTest, GoesOnWhenTheSeriesCannotBeWritten) {
   StopTheClock();
   InstallCollectors();
   WriteFile(std::string(kRunDir) + "/perf", "no directory");
-  FailCall("ALIBCFileCheckDir", 2, 0);  // asked whether the name is taken
+  On("ALIBCFileCheckDir").Nth(2).Return(0);  // asked whether the name is taken
   EXPECT_EQ(Collect(), 0);
   EXPECT_THAT(Log(), SizeIs(13));
   EXPECT_THAT(Log(), Contains(Logged(kUnit, "Error occured when parse perf data")));
@@ -430,10 +432,10 @@ TEST(StartCollectTest, GoesOnWhenTheSeriesCannotBeWritten) {
 TEST(StartCollectTest, WritesTheSeriesWhileItsChildrenRun) {
   StopTheClock();
   WaitLimit("1");
-  ReplaceCollector("udc", Hang);
-  ReplaceCollector("log", Hang);
+  On("QUENDELCollectUDC").Replace(Hang);
+  On("QUENDELCollectLog").Replace(Hang);
   bool seen = false;
-  OnSleep([&] { seen = Exists(std::string(kRunDir) + "/perf/quendel.perf.Memory"); });
+  On("sleep").Before([&] { seen = Exists(std::string(kRunDir) + "/perf/quendel.perf.Memory"); });
   EXPECT_EQ(QUENDELStartCollect(1, 0, PerfSeries()), -1);
   EXPECT_TRUE(seen);
 }
@@ -443,7 +445,7 @@ TEST(StartCollectTest, WritesNoSeriesBeforeItHasBothChildren) {
     RemoveFile(kRunDir);
     const Ending ending = RunIgnoringSigterm([nth] {
       StopTheClock();
-      FailCall("ALIBCProcForkEx", nth, -1);
+      On("ALIBCProcForkEx").Nth(nth).Return(-1);
       return Collect();
     });
     EXPECT_EQ(ending.result, -1);
@@ -454,23 +456,23 @@ TEST(StartCollectTest, WritesNoSeriesBeforeItHasBothChildren) {
 
 TEST(StartCollectTest, TakesAnyKindOfSeries) {
   StopTheClock();
-  OnSleep(AwaitAnyChild);
+  On("sleep").Before(AwaitAnyChild);
   EXPECT_EQ(QUENDELStartCollect(0, 0, JsonOf("[\"no\",\"series\"]")), 0);
   EXPECT_EQ(ReadFile(std::string(kRunDir) + "/perf/quendel.perf.System"), "null");
 }
 
 TEST(StartCollectTest, WaitsNoLongerThanItsChildrenTake) {
-  ReplaceCollector("udc", DoNothing);
-  ReplaceCollector("log", DoNothing);
+  On("QUENDELCollectUDC").Replace(DoNothing);
+  On("QUENDELCollectLog").Replace(DoNothing);
   EXPECT_EQ(Collect(), 0);
   EXPECT_LE(SleptSeconds(), 2);
 }
 
 TEST(StartCollectTest, GivesItsChildrenTheConfiguredTime) {
   WaitLimit("5");
-  ReplaceCollector("udc", Hang);
-  ReplaceCollector("log", DoNothing);
-  OnSleep([] { AwaitChild("log"); });
+  On("QUENDELCollectUDC").Replace(Hang);
+  On("QUENDELCollectLog").Replace(DoNothing);
+  On("sleep").Before([] { AwaitChild("log"); });
   EXPECT_EQ(QUENDELStartCollect(1, 0, PerfSeries()), -1);
   EXPECT_EQ(SleptSeconds(), 5);
   EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Timeout when wait child done")));
@@ -480,9 +482,9 @@ TEST(StartCollectTest, GivesItsChildrenTheConfiguredTime) {
 TEST(StartCollectTest, CountsAChildThatEndsInTheLastSecondAsTooLate) {
   InstallCollectors();
   WaitLimit("1");
-  ReplaceCollector("udc", EndWhenTold);
+  On("QUENDELCollectUDC").Replace(EndWhenTold);
   const auto before = CollectorConf();
-  OnSleep([] {
+  On("sleep").Before([] {
     WriteFile("/tmp/end", "");
     AwaitChild("udc");
     AwaitChild("log");
@@ -495,9 +497,9 @@ TEST(StartCollectTest, CountsAChildThatEndsInTheLastSecondAsTooLate) {
 
 TEST(StartCollectTest, CountsOnlySecondsSlept) {
   WaitLimit("2");
-  ReplaceCollector("udc", EndWhenTold);
-  ReplaceCollector("log", EndWhenTold);
-  OnSleep([] {
+  On("QUENDELCollectUDC").Replace(EndWhenTold);
+  On("QUENDELCollectLog").Replace(EndWhenTold);
+  On("sleep").Before([] {
     WriteFile("/tmp/end", "");
     AwaitChild("udc");
     AwaitChild("log");
@@ -508,11 +510,11 @@ TEST(StartCollectTest, CountsOnlySecondsSlept) {
 
 TEST(StartCollectTest, EndsAChildThatTookTooLong) {
   WaitLimit("1");
-  ReplaceCollector("udc", Hang);
-  ReplaceCollector("log", Hang);
+  On("QUENDELCollectUDC").Replace(Hang);
+  On("QUENDELCollectLog").Replace(Hang);
   pid_t udc = 0;
   pid_t log = 0;
-  OnSleep([&] {
+  On("sleep").Before([&] {
     udc = ChildOf("udc");
     log = ChildOf("log");
   });
@@ -526,8 +528,8 @@ TEST(StartCollectTest, EndsAChildOfACallerThatIgnoresOrBlocksSigterm) {
   WaitLimit("1");
   const Ending ending = RunIgnoringSigterm([] {
     MaskSigterm(SIG_BLOCK);
-    ReplaceCollector("udc", Hang);
-    ReplaceCollector("log", Hang);
+    On("QUENDELCollectUDC").Replace(Hang);
+    On("QUENDELCollectLog").Replace(Hang);
     return QUENDELStartCollect(1, 0, PerfSeries());
   });
   EXPECT_EQ(ending.result, -1);
@@ -551,7 +553,7 @@ TEST(StartCollectTest, WaitsForNoUserDefinedCollectorBeyondTheLimit) {
     ClearLog();
     const Ending ending = InAGroupOfItsOwn([] {
       WaitLimit("1");
-      OnSleep([] {
+      On("sleep").Before([] {
         while (!Exists("/tmp/started")) {
           usleep(1000);
         }
@@ -582,9 +584,9 @@ TEST(StartCollectTest, WaitsForNothingThatACollectorLeavesBehind) {
 
 TEST(StartCollectTest, ReportsAStoppedChildAndGoesOn) {
   WaitLimit("1");
-  ReplaceCollector("udc", Hang);
+  On("QUENDELCollectUDC").Replace(Hang);
   pid_t udc = 0;
-  OnSleep([&] {
+  On("sleep").Before([&] {
     udc = ChildOf("udc");
     siginfo_t stopped;
     ASSERT_EQ(kill(udc, SIGSTOP), 0);
@@ -599,7 +601,7 @@ TEST(StartCollectTest, ReportsAStoppedChildAndGoesOn) {
 TEST(StartCollectTest, CountsAChildThatDiedAsFinished) {
   StopTheClock();
   InstallCollectors();
-  ReplaceCollector("udc", Die);
+  On("QUENDELCollectUDC").Replace(Die);
   EXPECT_EQ(Collect(), 0);
   const auto entries = ArchiveEntries(kArchive);
   EXPECT_EQ(entries.count(std::string(kRunName) + "/udc/udc.result"), 0U);
@@ -614,8 +616,8 @@ TEST(StartCollectTest, NeverCommitsWhatAnOlderRunStaged) {
     WriteFile(quendel::kLogUpdateFile,
               "[/usr/arvo/etc/quendel/quendel.log.messages]\ntotal_byte=999\n");
     WriteFile(quendel::kUdcUpdateFile, "[/usr/arvo/etc/quendel/quendel.udc.raid]\nlast_hash=999\n");
-    ReplaceCollector("udc", collect);
-    ReplaceCollector("log", collect);
+    On("QUENDELCollectUDC").Replace(collect);
+    On("QUENDELCollectLog").Replace(collect);
     EXPECT_EQ(Collect(1), 0);
     EXPECT_EQ(CollectorConf(), before);
     EXPECT_THAT(Log(), IsEmpty());
@@ -625,19 +627,19 @@ TEST(StartCollectTest, NeverCommitsWhatAnOlderRunStaged) {
 TEST(StartCollectTest, NeverCommitsResultsThatAKilledChildHadNoTimeToWrite) {
   InstallCollectors();
   const auto before = CollectorConf();
-  ReplaceCollector("udc", [](const char* directory) {
+  On("QUENDELCollectUDC").Replace([](const char* directory) {
     WriteFile(quendel::kUdcUpdateFile, "[/usr/arvo/etc/quendel/quendel.udc.raid]\nlast_hash=1\n");
     return Die(directory);
   });
-  ReplaceCollector("log", DoNothing);
+  On("QUENDELCollectLog").Replace(DoNothing);
   EXPECT_EQ(Collect(), 0);
   EXPECT_EQ(CollectorConf(), before);
 }
 
 TEST(StartCollectTest, CommitsTheLogsThatAKilledChildHadFinished) {
   InstallCollectors();
-  ReplaceCollector("udc", DoNothing);
-  ReplaceCollector("log", [](const char* directory) {
+  On("QUENDELCollectUDC").Replace(DoNothing);
+  On("QUENDELCollectLog").Replace([](const char* directory) {
     WriteFile(quendel::kLogUpdateFile,
               "[/usr/arvo/etc/quendel/quendel.log.messages]\ntotal_byte=6\n");
     return Die(directory);
@@ -650,8 +652,8 @@ TEST(StartCollectTest, FailsWhenAChildOfTheCallerEndsMeanwhile) {
   InstallCollectors();
   const auto before = CollectorConf();
   const Ending ending = InAGroupOfItsOwn([] {
-    ReplaceCollector("udc", Hang);
-    ReplaceCollector("log", Hang);
+    On("QUENDELCollectUDC").Replace(Hang);
+    On("QUENDELCollectLog").Replace(Hang);
     if (fork() == 0) {
       setsid();  // even one that is not of the caller's group any more
       _exit(7);
@@ -679,8 +681,8 @@ TEST(StartCollectTest, LeavesOtherChildrenOfTheCallerAlone) {
     if (other == 0) {
       Hang(nullptr);
     }
-    ReplaceCollector("udc", DoNothing);
-    ReplaceCollector("log", DoNothing);
+    On("QUENDELCollectUDC").Replace(DoNothing);
+    On("QUENDELCollectLog").Replace(DoNothing);
     const int result = Collect();
     EXPECT_EQ(waitpid(other, nullptr, WNOHANG), 0);
     kill(other, SIGKILL);
@@ -693,12 +695,12 @@ TEST(StartCollectTest, ProbesItsChildrenAndNobodyElseAfterward) {
   Record("kill");
   pid_t udc = 0;
   pid_t log = 0;
-  OnSleep([&] {
+  On("sleep").Before([&] {
     udc = ChildOf("udc");
     log = ChildOf("log");
     AwaitAnyChild();
   });
-  ReplaceCollector("log", [](const char*) { return usleep(100000); });
+  On("QUENDELCollectLog").Replace([](const char*) { return usleep(100000); });
   ASSERT_EQ(QUENDELStartCollect(1, 0, PerfSeries()), 0);
   EXPECT_THAT(Recorded(), ElementsAre(std::to_string(udc) + "|0", std::to_string(log) + "|0"));
 }
@@ -706,11 +708,11 @@ TEST(StartCollectTest, ProbesItsChildrenAndNobodyElseAfterward) {
 TEST(StartCollectTest, TellsWhichChildItCannotSignal) {
   WaitLimit("1");
   for (const char* kind : {"udc", "log"}) {
-    ReplaceCollector(kind, EndWhenTold);
+    On(CollectorOf(kind)).Replace(EndWhenTold);
   }
-  FailCall("kill", 2, -1, EPERM);  // the first is the probe
+  On("kill").Nth(2).Return(-1, EPERM);  // the first is the probe
   pid_t udc = 0;
-  OnSleep([&] {
+  On("sleep").Before([&] {
     udc = ChildOf("udc");
     if (fork() == 0) {
       while (Log().size() < 2) {
@@ -728,7 +730,7 @@ TEST(StartCollectTest, TellsWhichChildItCannotSignal) {
 
 TEST(StartCollectTest, SignalsTheCallersGroupWhenItFailsBeforeItHasChildren) {
   const Ending ending = InAGroupOfItsOwn([] {
-    FailCall("time", 1, -1);
+    On("time").Nth(1).Return(-1);
     return Collect();
   });
   EXPECT_EQ(ending.signal, SIGTERM);
@@ -738,7 +740,7 @@ TEST(StartCollectTest, SignalsTheCallersGroupWhenItFailsBeforeItHasChildren) {
 
 TEST(StartCollectTest, CleansUpInACallerThatSurvivesTheSignal) {
   const Ending ending = RunIgnoringSigterm([] {
-    FailCall("time", 1, -1);
+    On("time").Nth(1).Return(-1);
     Record("kill");
     const int result = Collect(1);
     EXPECT_THAT(Recorded(), ElementsAre("0|0", "0|15", "0|0", "0|15"));
@@ -753,7 +755,7 @@ TEST(StartCollectTest, CleansUpInACallerThatSurvivesTheSignal) {
 
 TEST(StartCollectTest, EndsAndReapsAChildOfTheCallersGroup) {
   const Ending ending = RunIgnoringSigterm([] {
-    FailCall("time", 1, -1);
+    On("time").Nth(1).Return(-1);
     // The child starts with its action set, and misses no signal.
     MaskSigterm(SIG_BLOCK);
     signal(SIGTERM, SIG_DFL);
@@ -779,7 +781,7 @@ TEST(StartCollectTest, LeavesItsFilesToTheParentOfACallerThatTheSignalEnds) {
   InstallCollectors();
   const auto before = CollectorConf();
   const Ending ending = InAGroupOfItsOwn([] {
-    FailCall("mkdir", 3, -1, ENOSPC);
+    On("mkdir").Nth(3).Return(-1, ENOSPC);
     return Collect(1);
   });
   EXPECT_EQ(ending.signal, SIGTERM);
@@ -793,8 +795,8 @@ TEST(StartCollectTest, LeavesAMarkerToTheParentOfACallerThatTheSignalEnds) {
   InstallCollectors();
   const auto before = CollectorConf();
   const Ending ending = InAGroupOfItsOwn([] {
-    FailCall("ALIBCProcForkEx", 2, -1);
-    ReplaceCollector("udc", Hang);
+    On("ALIBCProcForkEx").Nth(2).Return(-1);
+    On("QUENDELCollectUDC").Replace(Hang);
     return Collect(1);
   });
   EXPECT_EQ(ending.signal, SIGTERM);
@@ -818,7 +820,7 @@ TEST(StartCollectTest, FailsWhenADirectoryCannotBeMade) {
     ClearLog();
     const Ending ending = RunIgnoringSigterm([i] {
       StopTheClock();
-      FailCall("mkdir", static_cast<int>(i) + 1, -1, EACCES);
+      On("mkdir").Nth(static_cast<int>(i) + 1).Return(-1, EACCES);
       const int result = Collect();
       EXPECT_EQ(Calls("ALIBCProcForkEx"), 0);
       return result;
@@ -840,7 +842,7 @@ TEST(StartCollectTest, TakesAFileInTheWorkRootsPlaceForADirectory) {
 
 TEST(StartCollectTest, FailsWithoutAUdcChild) {
   const Ending ending = RunIgnoringSigterm([] {
-    FailCall("ALIBCProcForkEx", 1, -1);
+    On("ALIBCProcForkEx").Nth(1).Return(-1);
     return Collect();
   });
   EXPECT_EQ(ending.result, -1);
@@ -852,8 +854,8 @@ TEST(StartCollectTest, FailsWithoutAUdcChild) {
 
 TEST(StartCollectTest, EndsTheUdcChildWhenThereIsNoLogChild) {
   const Ending ending = RunIgnoringSigterm([] {
-    FailCall("ALIBCProcForkEx", 2, -1);
-    ReplaceCollector("udc", Hang);
+    On("ALIBCProcForkEx").Nth(2).Return(-1);
+    On("QUENDELCollectUDC").Replace(Hang);
     return Collect();
   });
   EXPECT_EQ(ending.result, -1);
@@ -867,8 +869,8 @@ TEST(StartCollectTest, EndsTheUdcChildWhenThereIsNoLogChild) {
 TEST(StartCollectTest, EndsAChildThatHasHardlyBegun) {
   for (int i = 0; i < 20; ++i) {
     const Ending ending = RunIgnoringSigterm([] {
-      FailCall("ALIBCProcForkEx", 2, -1);
-      ReplaceCollector("udc", Hang);
+      On("ALIBCProcForkEx").Nth(2).Return(-1);
+      On("QUENDELCollectUDC").Replace(Hang);
       return Collect();
     });
     ASSERT_EQ(ending.signal, 0);
@@ -879,7 +881,7 @@ TEST(StartCollectTest, EndsAChildThatHasHardlyBegun) {
 TEST(StartCollectTest, FailsWhenTheDirectoryCannotBePacked) {
   StopTheClock();
   InstallCollectors();
-  FailCall("ALIBCExecl", 1, 2);
+  On("ALIBCExecl").Nth(1).Return(2);
   EXPECT_EQ(Collect(), -1);
   EXPECT_THAT(Log(), ElementsAre(Logged("quendel_tar_collect_data",
                                         "Failed to tar '" + std::string(kRunDir) + "'")));
@@ -898,7 +900,7 @@ TEST(StartCollectTest, NeverContactsTheServerUnlessAsked) {
 TEST(StartCollectTest, FailsWhenTheLogsStateCannotBeCommitted) {
   InstallCollectors();
   const auto before = CollectorConf();
-  FailCall("ALIBCFileEnumSection", 1, -1);
+  On("ALIBCFileEnumSection").Nth(1).Return(-1);
   EXPECT_EQ(Collect(), -1);
   EXPECT_THAT(Log(), ElementsAre(Logged("quendel_update_conf", _),
                                  Logged(kUnit, "Failed to update log config")));
@@ -908,7 +910,7 @@ TEST(StartCollectTest, FailsWhenTheLogsStateCannotBeCommitted) {
 TEST(StartCollectTest, FailsWhenTheUserDefinedCollectorsStateCannotBeCommitted) {
   InstallCollectors();
   const auto before = CollectorConf();
-  FailCall("ALIBCFileEnumSection", 2, -1);
+  On("ALIBCFileEnumSection").Nth(2).Return(-1);
   EXPECT_EQ(Collect(), -1);
   EXPECT_THAT(Log(), ElementsAre(Logged("quendel_update_conf", _),
                                  Logged(kUnit, "Failed to update udc config")));
@@ -919,7 +921,7 @@ TEST(StartCollectTest, FailsWhenTheUserDefinedCollectorsStateCannotBeCommitted) 
 
 TEST(StartCollectTest, SucceedsWhenTheRunDirectoryCannotBeRemoved) {
   StopTheClock();
-  FailCall("ALIBCopyRemoveDir", 1, -1, EBUSY);
+  On("ALIBCopyRemoveDir").Nth(1).Return(-1, EBUSY);
   EXPECT_EQ(Collect(1), 0);
   EXPECT_THAT(Log(),
               ElementsAre(Logged(kUnit, "Error happened when remove " + std::string(kRunDir) +
@@ -942,10 +944,10 @@ TEST(StartCollectTest, CleansUpInItsOrder) {
   StopTheClock();
   WaitLimit("1");
   WriteFile(std::string(kArchive) + "/in-its-place", "");
-  FailCall("ALIBCopyRemoveDir", 1, -1, EBUSY);
+  On("ALIBCopyRemoveDir").Nth(1).Return(-1, EBUSY);
   std::vector<testing::Matcher<LogLine>> stopped;
   std::vector<testing::Matcher<LogLine>> marked;
-  OnSleep([&] {
+  On("sleep").Before([&] {
     for (const std::string kind : {"udc", "log"}) {
       const pid_t child = ChildOf(kind);
       const std::string marker = "/tmp/quendel/" + kind + ".p." + std::to_string(child);
@@ -959,8 +961,8 @@ TEST(StartCollectTest, CleansUpInItsOrder) {
       marked.push_back(Logged(kUnit, "Failed to remove " + marker + " [errno=39]"));
     }
   });
-  ReplaceCollector("udc", Hang);
-  ReplaceCollector("log", Hang);
+  On("QUENDELCollectUDC").Replace(Hang);
+  On("QUENDELCollectLog").Replace(Hang);
   EXPECT_EQ(QUENDELStartCollect(1, 0, PerfSeries()), -1);
   ASSERT_THAT(stopped, SizeIs(2));
   EXPECT_THAT(
@@ -977,26 +979,26 @@ TEST(StartCollectTest, LeavesNoTraceOfARunThatFailed) {
   InstallCollectors();
   const auto before = CollectorConf();
   const std::vector<std::function<void()>> faults = {
-      [] { FailCall("mkdir", 1, -1, ENOSPC); },
-      [] { FailCall("mkdir", 2, -1, ENOSPC); },
-      [] { FailCall("mkdir", 3, -1, ENOSPC); },
-      [] { FailCall("mkdir", 4, -1, ENOSPC); },
-      [] { FailCall("time", 1, -1); },
-      [] { FailCall("ALIBCProcForkEx", 1, -1); },
-      [] { FailCall("ALIBCProcForkEx", 2, -1); },
-      [] { FailCall("waitpid", 1, -1, ECHILD); },
-      [] { FailCall("waitpid", 1, 999999); },
+      [] { On("mkdir").Nth(1).Return(-1, ENOSPC); },
+      [] { On("mkdir").Nth(2).Return(-1, ENOSPC); },
+      [] { On("mkdir").Nth(3).Return(-1, ENOSPC); },
+      [] { On("mkdir").Nth(4).Return(-1, ENOSPC); },
+      [] { On("time").Nth(1).Return(-1); },
+      [] { On("ALIBCProcForkEx").Nth(1).Return(-1); },
+      [] { On("ALIBCProcForkEx").Nth(2).Return(-1); },
+      [] { On("waitpid").Nth(1).Return(-1, ECHILD); },
+      [] { On("waitpid").Nth(1).Return(999999); },
       [] {
         WaitLimit("1");
-        ReplaceCollector("udc", Hang);
+        On("QUENDELCollectUDC").Replace(Hang);
       },
-      [] { FailCall("ALIBCExecl", 1, -1); },
-      [] { FailCall("ALIBCExecl", 1, 2); },
-      [] { FailCall("ALIBCFileEnumSection", 1, -1); },
+      [] { On("ALIBCExecl").Nth(1).Return(-1); },
+      [] { On("ALIBCExecl").Nth(1).Return(2); },
+      [] { On("ALIBCFileEnumSection").Nth(1).Return(-1); },
   };
   for (size_t i = 0; i < faults.size(); ++i) {
     const Ending ending = RunIgnoringSigterm([&] {
-      OnSleep([] { AwaitChild("log"); });
+      On("sleep").Before([] { AwaitChild("log"); });
       faults[i]();
       return QUENDELStartCollect(1, 0, PerfSeries());
     });

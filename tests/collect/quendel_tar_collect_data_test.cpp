@@ -10,7 +10,7 @@
 #include "collect/archive_entries.h"
 #include "quendel.h"
 #include "support/appliance.h"
-#include "support/faults.h"
+#include "support/calls.h"
 #include "support/log.h"
 
 using namespace quendel::test;
@@ -26,7 +26,7 @@ constexpr char kArchive[] = "/tmp/out.tar.xz";
 // Notes how tar would be run, without running it.
 std::vector<std::string> RunFor(const char* dir) {
   Record("ALIBCExecl");
-  FailCall("ALIBCExecl", 1, 0);
+  On("ALIBCExecl").Nth(1).Return(0);
   EXPECT_EQ(QUENDELTarCollectData(dir, kArchive), 0);
   return Recorded();
 }
@@ -98,7 +98,7 @@ TEST(TarCollectDataTest, FailsOnATrailingSlash) {
 
 TEST(TarCollectDataTest, FailsWhenTarCannotBeStarted) {
   WriteFile("/tmp/a/b/f", "1");
-  FailCall("ALIBCExecl", 1, -1);
+  On("ALIBCExecl").Nth(1).Return(-1);
   ExpectFailure("/tmp/a/b");
 }
 
@@ -144,7 +144,7 @@ TEST(TarCollectDataTest, ClosesAnOlderArchiveToOthers) {
 
 TEST(TarCollectDataTest, RemovesAnEmptyArchiveAgain) {
   for (const long status : {-1, 2}) {
-    FailCall("ALIBCExecl", 1, status);
+    On("ALIBCExecl").Nth(1).Return(status);
     ClearLog();
     ExpectFailure("/tmp/a/b");
     EXPECT_FALSE(Exists(kArchive)) << status;
@@ -162,7 +162,7 @@ TEST(TarCollectDataTest, KeepsWhatTarWroteBeforeItFailed) {
 
 TEST(TarCollectDataTest, KeepsAnOlderArchiveWhenTarCannotBeRun) {
   WriteFile(kArchive, "");
-  FailCall("ALIBCExecl", 1, -1);
+  On("ALIBCExecl").Nth(1).Return(-1);
   ExpectFailure("/tmp/a/b");
   EXPECT_TRUE(Exists(kArchive));
 }

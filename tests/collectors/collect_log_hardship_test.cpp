@@ -10,11 +10,11 @@
 #include <filesystem>
 #include <fstream>
 
-#include "collectors/file_calls.h"
 #include "model/collector_files.h"
 #include "model/xz.h"
 #include "quendel.h"
 #include "support/appliance.h"
+#include "support/calls.h"
 #include "support/log.h"
 
 using namespace quendel::test;
@@ -187,12 +187,11 @@ TEST(CollectLogTest, FailsToContinueALogThatMayNoLongerBeRead) {
 TEST(CollectLogTest, KeepsTheStateOfALogOnABadDisk) {
   InstallCollected("first\n");
   AppendFile(kLog, "second\n");
-  const auto working = OnFileCalls().pread;
-  OnFileCalls().pread = FailsWith(EIO);
+  On("pread").Return(-1, EIO);
   EXPECT_EQ(Collect(), 0);
   EXPECT_THAT(Log(), LoggedInOrder(std::string("Failed to read hash line in log '") + kLog + "'",
                                    kDiffFailed, kLogFailed));
-  OnFileCalls().pread = working;
+  Restore("pread");
   CollectAndCommit();
   EXPECT_EQ(Delivered()["m"], "second\n");
 }
@@ -309,7 +308,7 @@ TEST(CollectLogTest, IgnoresADirectoryAmongTheConfigurations) {
 TEST(CollectLogTest, RecordsWhatItGotOfALogThatShrinks) {
   InstallCollected("first\n");
   AppendFile(kLog, "second\nthird\n");
-  OnFileCalls().sendfile = Once([] { fs::resize_file(kLog, 10); });
+  On("sendfile").Nth(1).Before([] { fs::resize_file(kLog, 10); });
   CollectAndCommit();
   EXPECT_EQ(Delivered()["m"], "seco\n");
   EXPECT_EQ(ReadPairs(kConf)["total_byte"], "10");
@@ -322,7 +321,7 @@ TEST(CollectLogTest, RecordsWhatItGotOfALogThatShrinks) {
 TEST(CollectLogTest, LeavesLinesThatArriveMeanwhileToTheNextRun) {
   InstallCollected("first\n");
   AppendFile(kLog, "second\n");
-  OnFileCalls().sendfile = Once([] { AppendFile(kLog, "third\n"); });
+  On("sendfile").Nth(1).Before([] { AppendFile(kLog, "third\n"); });
   CollectAndCommit();
   EXPECT_EQ(Delivered()["m"], "second\n");
   CollectAndCommit();
@@ -334,11 +333,7 @@ TEST(CollectLogTest, LeavesLinesThatArriveMeanwhileToTheNextRun) {
 TEST(CollectLogTest, LeavesLinesThatArriveBeforeTheLogIsOpenedToTheNextRun) {
   InstallCollected("first\n");
   AppendFile(kLog, "second\n");
-  OnFileCalls().stat = [asked = 0](const char* path, struct stat&) mutable {
-    if (path == std::string(kLog) && ++asked == 2) {
-      AppendFile(kLog, "third\n");
-    }
-  };
+  OnceMeasured(kLog, [] { AppendFile(kLog, "third\n"); });
   CollectAndCommit();
   EXPECT_EQ(Delivered()["m"], "second\n");
   CollectAndCommit();
@@ -348,7 +343,7 @@ TEST(CollectLogTest, LeavesLinesThatArriveBeforeTheLogIsOpenedToTheNextRun) {
 TEST(CollectLogTest, LosesNothingOfALogThatIsRotatedWhileItIsCopied) {
   InstallCollected("first\n");
   AppendFile(kLog, "second\n");
-  OnFileCalls().sendfile = Once([] {
+  On("sendfile").Nth(1).Before([] {
     AppendFile(kLog, "third\n");
     Rotate(kLog);
     AppendFile(kLog, "fourth\n");
@@ -363,13 +358,10 @@ TEST(CollectLogTest, LosesNothingOfALogThatIsRotatedWhileItIsCopied) {
 TEST(CollectLogTest, LosesNothingOfALogThatIsRotatedBeforeItIsOpened) {
   InstallCollected("first\n");
   AppendFile(kLog, "second\n");
-  OnFileCalls().stat = [rotated = false](const char* path, struct stat& status) mutable {
-    if (path == std::string(kLog) && !std::exchange(rotated, true)) {
-      Rotate(kLog);
-      AppendFile(kLog, "third\n");
-      stat(kLog, &status);
-    }
-  };
+  On("stat").Anywhere().With(kLog).Nth(1).Before([] {
+    Rotate(kLog);
+    AppendFile(kLog, "third\n");
+  });
   CollectAndCommit();
   EXPECT_THAT(Delivered(), UnorderedElementsAre(Pair("m", "third\n")));
   // The archive does not continue what was recorded of the new log, so it is sent whole.

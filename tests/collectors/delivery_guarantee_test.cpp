@@ -7,12 +7,11 @@
 #include <filesystem>
 #include <utility>
 
-#include "collectors/file_calls.h"
 #include "model/collector_files.h"
 #include "model/xz.h"
 #include "quendel.h"
 #include "support/appliance.h"
-#include "support/faults.h"
+#include "support/calls.h"
 
 using namespace quendel::test;
 
@@ -60,13 +59,6 @@ uint64_t InodeOf(const std::string& path) {
   struct stat status = {};
   EXPECT_EQ(stat(path.c_str(), &status), 0);
   return status.st_ino;
-}
-
-// Gives a path this inode number from now on, whatever file is there.
-void ShowInode(const std::string& shownPath, uint64_t inode) {
-  OnFileCalls().stat = [shownPath, inode](const char* path, struct stat& status) {
-    status.st_ino = path == shownPath ? inode : status.st_ino;
-  };
 }
 
 // Writes over the log without making a new file.
@@ -234,7 +226,7 @@ TEST(DeliveryGuaranteeTest, LinesAreLostInTheOldestNewArchiveWhenItCannotBePrepa
     AppendFile(kLog, line + "\n");
     Rotate(kLog);
     ResetCalls();
-    FailCall(failure.call, failure.nth, -1);
+    On(failure.call).Nth(failure.nth).Return(-1);
     EXPECT_FALSE(ArrivesLater(line));
   }
 }
@@ -274,14 +266,11 @@ TEST(DeliveryGuaranteeTest, LinesAreLostInAnArchiveThatIsRenumberedInTheRun) {
   AppendFile(kLog, "lost\n");
   Rotate(kLog);
   AppendFile(kLog, "four\n");
-  // An archive is asked for whether it is there, and then for its inode. That of the last one
-  // ends the look at them.
-  OnFileCalls().stat = [asked = 0](const char* path, struct stat&) mutable {
-    if (path == ArchiveOf(kLog, 2) && ++asked == 2) {
-      Rotate(kLog);
-      AppendFile(kLog, "five\n");
-    }
-  };
+  // The inode of the last archive ends the look at them.
+  OnceMeasured(ArchiveOf(kLog, 2), [] {
+    Rotate(kLog);
+    AppendFile(kLog, "five\n");
+  });
   Deliver();
   EXPECT_FALSE(ArrivesLater("lost"));
   EXPECT_TRUE(HasArrived("four")) << "it is sent instead";
@@ -355,13 +344,10 @@ TEST(DeliveryGuaranteeTest, LinesAreLostOfAnArchiveWhenTheLiveLogContinues) {
 TEST(DeliveryGuaranteeTest, LinesAreLostOfAnArchiveThatBeginsLikeTheLiveLog) {
   InstallCollected("header\nA\n");
   AppendFile(kLog, "lost\n");
-  OnFileCalls().stat = [rotated = false](const char* path, struct stat& status) mutable {
-    if (path == std::string(kLog) && !std::exchange(rotated, true)) {
-      Rotate(kLog);
-      AppendFile(kLog, "header\n");
-      stat(kLog, &status);
-    }
-  };
+  On("stat").Anywhere().With(kLog).Nth(1).Before([] {
+    Rotate(kLog);
+    AppendFile(kLog, "header\n");
+  });
   Deliver();
   AppendFile(kLog, "two\n");
   Deliver();
@@ -412,7 +398,7 @@ TEST(DeliveryGuaranteeTest, LinesAreLostThatACallerCommitsAfterARunThatFailed) {
   InstallCollected("one\n");
   AppendFile(kLog, "lost\n");
   EXPECT_EQ(Collect(), 0);  // not delivered, and not committed
-  FailCall("ALIBCSzListAlloc", 1, 0);
+  On("ALIBCSzListAlloc").Nth(1).Return(nullptr);
   EXPECT_EQ(Collect(), -1);
   Commit();  // what is committed is the state of the run before
   EXPECT_FALSE(ArrivesLater("lost"));

@@ -9,9 +9,9 @@
 #include <filesystem>
 
 #include "base/file_io.h"
-#include "collectors/file_calls.h"
 #include "quendel.h"
 #include "support/appliance.h"
+#include "support/calls.h"
 
 using namespace quendel;
 using namespace quendel::test;
@@ -75,6 +75,17 @@ std::string CopyByLines(const std::string& text, size_t position, size_t limit, 
   return out;
 }
 
+// For the first call, the third and so on.
+std::function<bool()> EveryOtherTime() {
+  return [calls = 0]() mutable { return ++calls % 2 != 0; };
+}
+
+void FillTheDisk() {
+  for (const char* way : {"copy_file_range", "sendfile", "write"}) {
+    On(way).Return(-1, ENOSPC);
+  }
+}
+
 }  // namespace
 
 TEST(ReadLineTest, ReadsALineOfAnyLength) {
@@ -119,19 +130,15 @@ TEST(ReadLineTest, FindsNoLineAtOrBehindTheEnd) {
 
 TEST(ReadLineTest, TellsAnErrorFromTheEnd) {
   const OwnedFd file = Source("ab\n");
-  OnFileCalls().pread = FailsWith(EIO);
+  On("pread").Return(-1, EIO);
   LineMark line;
   EXPECT_EQ(ReadLine(file.get(), 0, line), ReadResult::kError);
 }
 
 TEST(ReadLineTest, ReadsOnAfterAnInterruptionAndAShortRead) {
   const OwnedFd file = Source(LineOf(100) + "\n");
-  int calls = 0;
-  OnFileCalls().pread = [&](size_t& count) {
-    count = 7;
-    errno = EINTR;
-    return ++calls % 2 == 0;
-  };
+  On("pread").Shorten(7);
+  On("pread").When(EveryOtherTime()).Return(-1, EINTR);
   LineMark line;
   ASSERT_EQ(ReadLine(file.get(), 0, line), ReadResult::kLine);
   ExpectLine(line, LineOf(100), 101);
@@ -172,17 +179,13 @@ TEST(ReadLastLineTest, FindsNoLineInAnEmptyFile) {
 
 TEST(ReadLastLineTest, FailsWhenTheFileCannotBeRead) {
   const OwnedFd file = Source("a\nb\n");
-  int calls = 0;
   for (const int failing : {1, 2, 3}) {
-    calls = 0;
-    OnFileCalls().pread = [&](size_t&) {
-      errno = EIO;
-      return ++calls != failing;
-    };
+    ResetCalls();
+    On("pread").Nth(failing).Return(-1, EIO);
     LineMark line;
     EXPECT_EQ(ReadLastLine(file.get(), line), ReadResult::kError) << failing;
   }
-  EXPECT_EQ(calls, 3);
+  EXPECT_EQ(Calls("pread"), 3);
 }
 
 TEST(CopyLinesTest, CopiesLineByLineAsFarAsTheLimit) {
@@ -221,12 +224,11 @@ TEST(CopyLinesTest, TakesOneLineThatLiesBehindTheLimit) {
 
 TEST(CopyLinesTest, CopiesByWhicheverWayTheFileSystemsAllow) {
   const std::string text = LineOf(150000) + "\n" + LineOf(10) + "\n";
-  const auto never = FailsWith(EXDEV);
-  const auto notHere = FailsWith(EINVAL);
-  for (const auto& range : {std::function<bool(size_t&)>(), never}) {
-    for (const auto& send : {std::function<bool(size_t&)>(), notHere}) {
-      OnFileCalls().copy_file_range = range;
-      OnFileCalls().sendfile = send;
+  for (const bool byRange : {true, false}) {
+    for (const bool bySending : {true, false}) {
+      ResetCalls();
+      On("copy_file_range").When([=] { return !byRange; }).Return(-1, EXDEV);
+      On("sendfile").When([=] { return !bySending; }).Return(-1, EINVAL);
       int64_t taken = 0;
       EXPECT_EQ(Copy(text, 0, static_cast<int64_t>(text.size()), taken), text);
       EXPECT_EQ(taken, static_cast<int64_t>(text.size()));
@@ -236,13 +238,11 @@ TEST(CopyLinesTest, CopiesByWhicheverWayTheFileSystemsAllow) {
 
 TEST(CopyLinesTest, GoesOnWhereAWayOfCopyingStopped) {
   const std::string text = LineOf(1000) + "\n";
-  const auto stopsAfterTwo = [calls = 0](size_t& count) mutable {
-    count = 100;
-    errno = EIO;
-    return ++calls <= 2;
-  };
-  OnFileCalls().copy_file_range = stopsAfterTwo;
-  OnFileCalls().sendfile = stopsAfterTwo;
+  for (const char* way : {"copy_file_range", "sendfile"}) {
+    On(way).Return(-1, EIO);
+    On(way).Nth(1).Shorten(100);
+    On(way).Nth(2).Shorten(100);
+  }
   WriteFile("/tmp/source", text);  // where a range can be copied
   struct stat status = {};
   const OwnedFd source = OpenRegularFile("/tmp/source", status);
@@ -253,39 +253,28 @@ TEST(CopyLinesTest, GoesOnWhereAWayOfCopyingStopped) {
 
 TEST(CopyLinesTest, TriesAgainAfterAnInterruption) {
   const std::string text = LineOf(1000) + "\n";
-  const auto interrupted = [calls = 0](size_t& count) mutable {
-    count = std::min<size_t>(count, 300);
-    errno = EINTR;
-    return ++calls % 2 == 0;
-  };
-  int sent = 0;
-  OnFileCalls().copy_file_range = FailsWith(EXDEV);
-  OnFileCalls().sendfile = [&](size_t& count) {
-    count = 300;
-    errno = EINTR;
-    return ++sent % 2 == 0;
-  };
+  for (const char* way : {"sendfile", "write", "pread"}) {
+    On(way).Shorten(300);
+    On(way).When(EveryOtherTime()).Return(-1, EINTR);
+  }
+  On("copy_file_range").Return(-1, EXDEV);
   int64_t taken = 0;
   EXPECT_EQ(Copy(text, 0, 1001, taken), text);
-  EXPECT_GE(sent, 8);
+  EXPECT_GE(Calls("sendfile"), 8);
 
-  OnFileCalls().sendfile = FailsWith(ENOSYS);
-  OnFileCalls().write = interrupted;
-  OnFileCalls().pread = interrupted;
+  On("sendfile").Return(-1, ENOSYS);
   EXPECT_EQ(Copy(text, 0, 1001, taken), text);
 }
 
 TEST(CopyLinesTest, FailsWhenNothingCanBeWritten) {
-  OnFileCalls().copy_file_range = FailsWith(ENOSPC);
-  OnFileCalls().sendfile = FailsWith(ENOSPC);
-  OnFileCalls().write = FailsWith(ENOSPC);
+  FillTheDisk();
   int64_t taken = 0;
   Copy("one\ntwo\n", 0, 8, taken);
   EXPECT_LT(taken, 0);
 }
 
 TEST(CopyLinesTest, FailsWhenTheAddedNewlineCannotBeWritten) {
-  OnFileCalls().write = FailsWith(ENOSPC);
+  On("write").Return(-1, ENOSPC);
   int64_t taken = 0;
   Copy("unfinished", 0, 10, taken);
   EXPECT_LT(taken, 0);
@@ -293,10 +282,8 @@ TEST(CopyLinesTest, FailsWhenTheAddedNewlineCannotBeWritten) {
 
 TEST(CopyLinesTest, TellsAnErrorFromTheEnd) {
   for (const int failing : {1, 2}) {
-    OnFileCalls().pread = [calls = 0, failing](size_t&) mutable {
-      errno = EIO;
-      return ++calls != failing;
-    };
+    ResetCalls();
+    On("pread").Nth(failing).Return(-1, EIO);
     int64_t taken = 0;
     Copy("one\ntwo\n", 0, 8, taken);
     EXPECT_LT(taken, 0) << failing;
@@ -304,23 +291,14 @@ TEST(CopyLinesTest, TellsAnErrorFromTheEnd) {
 }
 
 TEST(CopyLinesTest, EndsWithTheSourceThatShrinksMeanwhile) {
-  const auto shrink = [](size_t&) {
-    std::filesystem::resize_file(kSource, 6);
-    errno = EXDEV;
-    return false;
-  };
-  OnFileCalls().copy_file_range = shrink;
+  On("copy_file_range").Before([] { std::filesystem::resize_file(kSource, 6); }).Return(-1, EXDEV);
   int64_t taken = 0;
   EXPECT_EQ(Copy("one\ntwo\nthree\n", 0, 14, taken), "one\ntw\n");
   EXPECT_EQ(taken, 6);
 }
 
 TEST(CopyLinesTest, TakesNothingThatArrivesMeanwhile) {
-  OnFileCalls().copy_file_range = [](size_t&) {
-    WriteFile(kSource, "one\ntwo and more\n");
-    errno = EXDEV;
-    return false;
-  };
+  On("copy_file_range").Before([] { WriteFile(kSource, "one\ntwo and more\n"); }).Return(-1, EXDEV);
   int64_t taken = 0;
   EXPECT_EQ(Copy("one\ntwo", 0, 7, taken), "one\ntwo\n");
   EXPECT_EQ(taken, 7);
@@ -336,8 +314,6 @@ TEST(CopyWholeTest, AddsAllOfTheSourceBehindWhatIsThere) {
 }
 
 TEST(CopyWholeTest, FailsWhenNothingCanBeWritten) {
-  OnFileCalls().copy_file_range = FailsWith(ENOSPC);
-  OnFileCalls().sendfile = FailsWith(ENOSPC);
-  OnFileCalls().write = FailsWith(ENOSPC);
+  FillTheDisk();
   EXPECT_FALSE(CopyWhole(Source("text").get(), Sink().get()));
 }

@@ -10,10 +10,10 @@
 #include <string>
 #include <vector>
 
-#include "collectors/file_calls.h"
 #include "model/collector_files.h"
 #include "quendel.h"
 #include "support/appliance.h"
+#include "support/calls.h"
 #include "support/json.h"
 #include "support/log.h"
 #include "support/own_work.h"
@@ -121,9 +121,11 @@ TEST(CollectorsNoMemoryTest, StagesNoUserDefinedCollectorWithoutItsResult) {
 
 TEST(CollectorsNoMemoryTest, CostsNoLogButTheOneThatNeedsIt) {
   // So wide that a list of them takes memory.
-  OnFileCalls().stat = [](const char* path, struct stat& status) {
-    status.st_ino += strstr(path, ".xz") == nullptr ? 0 : 10'000'000'000;
-  };
+  On("stat").Anywhere().With(HasSubstr(".xz")).Replace([](const char* path, struct stat* status) {
+    const int result = stat(path, status);
+    status->st_ino += 10'000'000'000;
+    return result;
+  });
   InstallGrownLogs({"a", "b"});
   int failures = 0;
   int partial = 0;

@@ -1,15 +1,15 @@
 // The log collector: what it delivers and stages, and what it does when a step fails.
 #include <gmock/gmock.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
 #include <filesystem>
 
-#include "collectors/file_calls.h"
 #include "model/collector_files.h"
 #include "model/xz.h"
 #include "quendel.h"
 #include "support/appliance.h"
-#include "support/faults.h"
+#include "support/calls.h"
 #include "support/log.h"
 
 using namespace quendel::test;
@@ -115,6 +115,17 @@ Pairs With(Pairs pairs, const std::string& key, const std::string& value) {
   return pairs;
 }
 
+// Its last bytes are lost.
+int CloseWithLoss(int file) {
+  close(file);
+  errno = EIO;
+  return -1;
+}
+
+bool ThereIsASnapshot() {
+  return Exists(kOutput + ".tmp") && !fs::is_empty(kOutput + ".tmp");
+}
+
 // Collects, which must fail to copy the log's new lines and must not count them as collected.
 void ExpectFailedDiff(const std::string& conf) {
   EXPECT_EQ(Collect(), 0);
@@ -136,13 +147,13 @@ TEST(CollectLogTest, NeedsTheConfigurationDirectory) {
 TEST(CollectLogTest, GoesOnWhenTheDirectoryCannotBeTold) {
   Install();
   WriteFile(kLog, "a\n");
-  FailCall("ALIBCFileCheckDir", 1, -1);
+  On("ALIBCFileCheckDir").Nth(1).Return(-1);
   EXPECT_EQ(Collect(), 0);
   EXPECT_THAT(Delivered(), UnorderedElementsAre(Pair("m", "a\n")));
 }
 
 TEST(CollectLogTest, FailsWithoutMemoryForTheNames) {
-  FailCall("ALIBCSzListAlloc", 1, 0);
+  On("ALIBCSzListAlloc").Nth(1).Return(nullptr);
   EXPECT_EQ(Collect(), -1);
   EXPECT_THAT(Log(), LoggedInOrder("Failed to allocate memory for list"));
 }
@@ -150,7 +161,7 @@ TEST(CollectLogTest, FailsWithoutMemoryForTheNames) {
 TEST(CollectLogTest, FailsWhenTheConfigurationsCannotBeListed) {
   Install();
   WriteFile(kLogUpdateFile, "[/x]\nlast_hash=old\n");
-  FailCall("ALIBCFileEnumDir", 1, -1);
+  On("ALIBCFileEnumDir").Nth(1).Return(-1);
   EXPECT_EQ(Collect(), -1);
   EXPECT_THAT(Log(), LoggedInOrder("Failed to enum dir '/usr/arvo/etc/quendel'"));
   EXPECT_FALSE(Exists(kLogUpdateFile)) << "what an earlier run staged goes first";
@@ -186,7 +197,7 @@ TEST(CollectLogTest, GoesOnWhenWhatWasStagedCannotBeRemoved) {
   Install();
   WriteFile(kLog, "a\n");
   WriteFile(kLogUpdateFile, "");
-  OnFileCalls().remove = [](const char* path) { return path != std::string(kLogUpdateFile); };
+  On("remove").With(kLogUpdateFile).Return(-1, EPERM);
   EXPECT_EQ(Collect(), 0);
   EXPECT_THAT(Log(), LoggedInOrder(std::string("Failed to remove ") + kLogUpdateFile +
                                    " [errno=" + std::to_string(EPERM) + "]"));
@@ -211,14 +222,14 @@ TEST(CollectLogTest, GoesOnToTheNextLogAfterAFailure) {
 
 TEST(CollectLogTest, FailsALogWithoutMemoryForItsRecord) {
   const std::string conf = Install();
-  FailCall("calloc", 1, 0);
+  On("calloc").Nth(1).Return(nullptr);
   EXPECT_EQ(Collect(), 0);
   EXPECT_THAT(Log(), LoggedInOrder("Failed to allocate memory for pLogConf", FailedIn(conf)));
 }
 
 TEST(CollectLogTest, FailsALogWithoutMemoryForItsState) {
   const std::string conf = Install();
-  FailCall("ALIBCSzHashAlloc", 1, 0);
+  On("ALIBCSzHashAlloc").Nth(1).Return(nullptr);
   EXPECT_EQ(Collect(), 0);
   EXPECT_THAT(Log(), LoggedInOrder("Failed to allocate memory for log hash", FailedIn(conf)));
 }
@@ -235,7 +246,7 @@ TEST(CollectLogTest, CountsAReplacedLogAsFailedWhenItsStateCannotBeStaged) {
     ClearLog();
     const std::string conf = Install();
     WriteFile(kLog, "a\n");
-    FailCall("ALIBCFileAddSection", 1, answer);
+    On("ALIBCFileAddSection").Nth(1).Return(answer);
     EXPECT_EQ(Collect(), 0);
     EXPECT_THAT(Log(), LoggedInOrder(kAddFailed, FailedIn(conf)));
   }
@@ -244,7 +255,7 @@ TEST(CollectLogTest, CountsAReplacedLogAsFailedWhenItsStateCannotBeStaged) {
 TEST(CollectLogTest, CountsAContinuedLogAsCollectedWhenItsStateCannotBeStaged) {
   InstallCollected("a\n");
   AppendFile(kLog, "b\n");
-  FailCall("ALIBCFileAddSection", 1, -1);
+  On("ALIBCFileAddSection").Nth(1).Return(-1);
   EXPECT_EQ(Collect(), 0);
   EXPECT_THAT(Log(), LoggedInOrder(kAddFailed));
 }
@@ -254,7 +265,7 @@ TEST(CollectLogTest, CountsARewrittenLogAsCollectedWhenItsStateCannotBeStaged) {
   AppendFile(kLog, "b\n");
   fs::resize_file(kLog, 0);
   AppendFile(kLog, "c\n123\n");
-  FailCall("ALIBCFileAddSection", 1, -1);
+  On("ALIBCFileAddSection").Nth(1).Return(-1);
   EXPECT_EQ(Collect(), 0);
   EXPECT_THAT(Log(), LoggedInOrder(std::string("Failed to collect diff log '") + kLog +
                                        "' because of hash not match",
@@ -407,7 +418,7 @@ TEST(CollectLogTest, StagesTheEmptyLineBeforeTheEndWhenNoLineFollows) {
 TEST(CollectLogTest, StagesTheSizeItSawFirstWhenNoLineFollows) {
   const std::string conf = InstallCollected("one\ntwo\n");
   AppendFile(kLog, "x");
-  OnFileCalls().pread = Once([] { fs::resize_file(kLog, 8); });
+  On("pread").Nth(1).Before([] { fs::resize_file(kLog, 8); });
   EXPECT_EQ(Collect(), 0);
   EXPECT_EQ(StagedOf(conf), LineState("", 9));
 }
@@ -423,16 +434,14 @@ TEST(CollectLogTest, CollectsNothingOfALogThatIsMissing) {
 TEST(CollectLogTest, FailsALogThatCannotBeMeasured) {
   const std::string conf = Install();
   WriteFile(kLog, "one\n");
-  FailCall("ALIBCFileStat", 1, -1);
+  On("ALIBCFileStat").Nth(1).Return(-1);
   EXPECT_EQ(Collect(), 0);
   EXPECT_THAT(Log(),
               LoggedInOrder(std::string("Failed to stat file '") + kLog + "'", FailedIn(conf)));
 }
 
 TEST(CollectLogTest, SendsALogOfAWideInodeWholeEveryTime) {
-  OnFileCalls().stat = [](const char* path, struct stat& status) {
-    status.st_ino = path == std::string(kLog) ? 4294967296 + 77 : status.st_ino;
-  };
+  ShowInode(kLog, 4294967296 + 77);
   const std::string conf = InstallCollected("one\n");
   EXPECT_EQ(ReadPairs(conf)["inode"], "77");
   CollectAndCommit();
@@ -440,9 +449,7 @@ TEST(CollectLogTest, SendsALogOfAWideInodeWholeEveryTime) {
 }
 
 TEST(CollectLogTest, KeepsTheWideInodesOfArchives) {
-  OnFileCalls().stat = [](const char* path, struct stat& status) {
-    status.st_ino = path == ArchiveOf(kLog, 1) ? 4294967296 + 77 : status.st_ino;
-  };
+  ShowInode(ArchiveOf(kLog, 1), 4294967296 + 77);
   const std::string conf = InstallRotated("one\n", {"two\n", "three\n"});
   CollectAndCommit();
   EXPECT_EQ(ReadPairs(conf)["tar_log_inode"], "4294967373");
@@ -501,8 +508,8 @@ TEST(CollectLogTest, FailsToContinueALogThatHadNoWholeLine) {
 TEST(CollectLogTest, FailsWhenTheNewLinesCannotBeWritten) {
   const std::string conf = InstallCollected("one\n");
   AppendFile(kLog, "two\n");
-  OnFileCalls().sendfile = FailsWith(ENOSPC);
-  OnFileCalls().write = FailsWith(ENOSPC);
+  On("sendfile").Return(-1, ENOSPC);
+  On("write").Return(-1, ENOSPC);
   ExpectFailedDiff(conf);
 }
 
@@ -510,17 +517,14 @@ TEST(CollectLogTest, FailsWhenTheNewLinesCannotBeReadBack) {
   const std::string conf = InstallCollected("one\n");
   AppendFile(kLog, "two\n");
   // The output's last byte is read to complete the line, and again to find where it begins.
-  OnFileCalls().pread = [read = 0](size_t& count) mutable {
-    errno = EIO;
-    return count != 1 || ++read != 2;
-  };
+  On("pread").With(kOutput).With(1).Nth(2).Return(-1, EIO);
   ExpectFailedDiff(conf);
 }
 
 TEST(CollectLogTest, FailsWhenTheNewLinesAreLostAtTheEnd) {
   const std::string conf = InstallCollected("one\n");
   AppendFile(kLog, "two\n");
-  OnFileCalls().close = [](int file) { return PathOfDescriptor(file) != kOutput; };
+  On("close").With(kOutput).Replace(CloseWithLoss);
   ExpectFailedDiff(conf);
 }
 
@@ -532,7 +536,7 @@ TEST(CollectLogTest, FailsWhenTheStateOfAContinuedLogCannotBeStaged) {
   for (const std::string key : {"last_hash", "total_byte", "last_byte"}) {
     ClearLog();
     ResetCalls();
-    FailCall("ALIBCSzHashSetValue", nth++, -1);
+    On("ALIBCSzHashSetValue").Nth(nth++).Return(-1);
     EXPECT_EQ(Collect(), 0);
     EXPECT_THAT(Log(), LoggedInOrder(FailedPair(key, state.at(key), conf),
                                      std::string("Failed to update config of log '") + kLog + "'",
@@ -547,7 +551,7 @@ TEST(CollectLogTest, FailsWhenTheStateOfAContinuedLogCannotBeStaged) {
 TEST(CollectLogTest, FailsWhenTheWholeLogCannotBeCopied) {
   const std::string conf = Install();
   WriteFile(kLog, "one\n");
-  FailCall("ARVOFileCopy", 1, -1);
+  On("ARVOFileCopy").Nth(1).Return(-1);
   EXPECT_EQ(Collect(), 0);
   EXPECT_THAT(
       Log(),
@@ -558,7 +562,7 @@ TEST(CollectLogTest, FailsWhenTheWholeLogCannotBeCopied) {
 TEST(CollectLogTest, FailsWhenARewrittenLogCannotBeCopied) {
   const std::string conf = InstallCollected("one\ntwo\n");
   WriteFile(kLog, "x\n");
-  FailCall("ARVOFileCopy", 1, -1);
+  On("ARVOFileCopy").Nth(1).Return(-1);
   EXPECT_EQ(Collect(), 0);
   EXPECT_THAT(
       Log(), LoggedInOrder(
@@ -575,7 +579,7 @@ TEST(CollectLogTest, FailsWhenTheStateOfAWholeLogCannotBeStaged) {
   for (const std::string key : {"inode", "last_hash", "total_byte", "last_byte"}) {
     ClearLog();
     ResetCalls();
-    FailCall("ALIBCSzHashSetValue", nth, -1);
+    On("ALIBCSzHashSetValue").Nth(nth).Return(-1);
     EXPECT_EQ(Collect(), 0);
     const std::string pair = FailedPair(key, state.at(key), conf);
     const std::string whole = std::string("Failed to collect whole log '") + kLog + "'";
@@ -593,7 +597,7 @@ TEST(CollectLogTest, FailsWhenTheStateOfAWholeLogCannotBeStaged) {
 TEST(CollectLogTest, FailsWhenTheCopyOfAWholeLogCannotBeOpened) {
   const std::string conf = Install();
   WriteFile(kLog, "one\n");
-  FailCall("ARVOFileCopy", 1, 0);  // so that there is no copy
+  On("ARVOFileCopy").Nth(1).Return(0);  // so that there is no copy
   EXPECT_EQ(Collect(), 0);
   EXPECT_THAT(Log(), LoggedInOrder("Failed to open file " + Quoted(kOutput),
                                    std::string("Failed to collect whole log '") + kLog + "'",
@@ -603,10 +607,7 @@ TEST(CollectLogTest, FailsWhenTheCopyOfAWholeLogCannotBeOpened) {
 TEST(CollectLogTest, FailsWhenTheCopyOfAWholeLogCannotBeRead) {
   const std::string conf = Install();
   WriteFile(kLog, "one\n");
-  OnFileCalls().pread = [](size_t& count) {
-    errno = EIO;
-    return count != 1;  // the copy's last byte, the first that is read of it
-  };
+  On("pread").With(kOutput).Return(-1, EIO);
   EXPECT_EQ(Collect(), 0);
   EXPECT_THAT(Log(), LoggedInOrder("Failed to open file " + Quoted(kOutput),
                                    std::string("Failed to collect whole log '") + kLog + "'",
@@ -652,7 +653,7 @@ std::string SpoilAppending(const Fail& fail) {
 
 TEST(CollectLogTest, FailsWhenTheOutputCannotBeMeasured) {
   const std::string conf = SpoilAppending([] {
-    FailCall("ALIBCFileStat", 4, -1);  // behind the archive, its plain copy and the live log
+    On("ALIBCFileStat").Nth(4).Return(-1);  // behind the archive, its plain copy and the live log
   });
   EXPECT_THAT(Log(), LoggedInOrder("Failed to stat file " + Quoted(kOutput),
                                    std::string("Failed to collect whole log '") + kLog + "'",
@@ -660,7 +661,7 @@ TEST(CollectLogTest, FailsWhenTheOutputCannotBeMeasured) {
 }
 
 TEST(CollectLogTest, FailsWhenTheSnapshotCannotBeMade) {
-  const std::string conf = SpoilAppending([] { FailCall("ARVOFileCopy", 2, -1); });
+  const std::string conf = SpoilAppending([] { On("ARVOFileCopy").Nth(2).Return(-1); });
   EXPECT_THAT(
       Log(),
       LoggedInOrder(std::string("Failed to copy log '") + kLog + "' to " + Quoted(kOutput + ".tmp"),
@@ -669,7 +670,7 @@ TEST(CollectLogTest, FailsWhenTheSnapshotCannotBeMade) {
 }
 
 TEST(CollectLogTest, FailsWhenTheSnapshotCannotBeOpened) {
-  const std::string conf = SpoilAppending([] { FailCall("ARVOFileCopy", 2, 0); });
+  const std::string conf = SpoilAppending([] { On("ARVOFileCopy").Nth(2).Return(0); });
   EXPECT_THAT(Log(), LoggedInOrder("Failed to open file " + Quoted(kOutput + ".tmp"),
                                    std::string("Failed to collect log '") + kLog + "'",
                                    std::string("Failed to collect whole log '") + kLog + "'",
@@ -691,13 +692,9 @@ TEST(CollectLogTest, NamesTheLogWhenTheOutputCannotBeAppendedTo) {
 
 TEST(CollectLogTest, FailsWhenTheSnapshotCannotBeAppended) {
   const std::string conf = SpoilAppending([] {
-    const auto onceThereIsASnapshot = [](size_t&) {
-      errno = ENOSPC;
-      return !Exists(kOutput + ".tmp") || fs::is_empty(kOutput + ".tmp");
-    };
-    OnFileCalls().copy_file_range = onceThereIsASnapshot;
-    OnFileCalls().sendfile = onceThereIsASnapshot;
-    OnFileCalls().write = onceThereIsASnapshot;
+    for (const char* way : {"copy_file_range", "sendfile", "write"}) {
+      On(way).When(ThereIsASnapshot).Return(-1, ENOSPC);
+    }
   });
   EXPECT_THAT(Log(), LoggedInOrder(std::string("Failed to collect log '") + kLog + "'",
                                    std::string("Failed to collect whole log '") + kLog + "'",
@@ -705,11 +702,8 @@ TEST(CollectLogTest, FailsWhenTheSnapshotCannotBeAppended) {
 }
 
 TEST(CollectLogTest, FailsWhenTheEndOfTheSnapshotIsLost) {
-  const std::string conf = SpoilAppending([] {
-    OnFileCalls().close = [](int file) {
-      return PathOfDescriptor(file) != kOutput || !Exists(kOutput + ".tmp");
-    };
-  });
+  const std::string conf = SpoilAppending(
+      [] { On("close").With(kOutput).When(ThereIsASnapshot).Replace(CloseWithLoss); });
   EXPECT_THAT(Log(), LoggedInOrder(std::string("Failed to collect log '") + kLog + "'",
                                    std::string("Failed to collect whole log '") + kLog + "'",
                                    FailedIn(conf)));
@@ -717,7 +711,7 @@ TEST(CollectLogTest, FailsWhenTheEndOfTheSnapshotIsLost) {
 
 TEST(CollectLogTest, GoesOnWhenTheSnapshotCannotBeRemoved) {
   InstallRotated("one\n", {"two\n", "three\n"});
-  OnFileCalls().remove = [](const char* path) { return path != kOutput + ".tmp"; };
+  On("remove").With(kOutput + ".tmp").Return(-1, EPERM);
   EXPECT_EQ(Collect(), 0);
   EXPECT_THAT(Log(), LoggedInOrder("Failed to remove " + kOutput +
                                    ".tmp [errno=" + std::to_string(EPERM) + "]"));
@@ -887,7 +881,7 @@ TEST(CollectLogTest, FailsWithoutMemoryForTheArchives) {
   for (const int nth : {2, 3}) {
     ClearLog();
     ResetCalls();
-    FailCall("ALIBCSzListAlloc", nth, 0);
+    On("ALIBCSzListAlloc").Nth(nth).Return(nullptr);
     EXPECT_EQ(Collect(), 0);
     EXPECT_THAT(Log(), LoggedInOrder("Failed to allocate memory for list", FailedTared(conf),
                                      FailedIn(conf)));
@@ -897,7 +891,7 @@ TEST(CollectLogTest, FailsWithoutMemoryForTheArchives) {
 
 TEST(CollectLogTest, FailsWhenAnArchiveCannotBeMeasured) {
   const std::string conf = InstallRotated("one\n", {"two\n", "three\n", "four\n"});
-  FailCall("ALIBCFileStat", 2, -1);
+  On("ALIBCFileStat").Nth(2).Return(-1);
   EXPECT_EQ(Collect(), 0);
   EXPECT_THAT(Log(),
               LoggedInOrder("Failed to stat file " + Quoted(ArchiveOf(kLog, 2)),
@@ -908,7 +902,7 @@ TEST(CollectLogTest, FailsWhenAnArchiveCannotBeMeasured) {
 
 TEST(CollectLogTest, FailsWithoutMemoryForAnArchivesInode) {
   const std::string conf = InstallRotated("one\n", {"two\n", "three\n"});
-  FailCall("ALIBCSzListPush", 1, -1);
+  On("ALIBCSzListPush").Nth(1).Return(-1);
   EXPECT_EQ(Collect(), 0);
   EXPECT_THAT(
       Log(),
@@ -919,7 +913,7 @@ TEST(CollectLogTest, FailsWithoutMemoryForAnArchivesInode) {
 
 TEST(CollectLogTest, FailsWhenTheKnownArchivesCannotBeRead) {
   const std::string conf = InstallRotated("one\n", {"two\n", "three\n"});
-  FailCall("ALIBCStrTok", 1, -1);
+  On("ALIBCStrTok").Nth(1).Return(-1);
   EXPECT_EQ(Collect(), 0);
   EXPECT_THAT(Log(), LoggedInOrder("Failed to parse tar log inode '\"\"'", FailedTared(conf),
                                    FailedIn(conf)));
@@ -927,7 +921,7 @@ TEST(CollectLogTest, FailsWhenTheKnownArchivesCannotBeRead) {
 
 TEST(CollectLogTest, DropsAnOldestArchiveThatCannotBeCopied) {
   const std::string conf = InstallRotated("one\n", {"two\n", "three\n", "four\n"});
-  FailCall("ARVOFileCopy", 1, -1);
+  On("ARVOFileCopy").Nth(1).Return(-1);
   EXPECT_EQ(Collect(), 0);
   EXPECT_THAT(Log(), LoggedInOrder("Failed to copy " + Quoted(ArchiveOf(kLog, 2)) + " to " +
                                    Quoted(kOutput + ".2.xz")));
@@ -941,7 +935,7 @@ TEST(CollectLogTest, DropsAnOldestArchiveThatCannotBeDecompressed) {
   for (const long answer : {-1L, 1L}) {
     ClearLog();
     ResetCalls();
-    FailCall("ALIBCExec", 1, answer);
+    On("ALIBCExec").Nth(1).Return(answer);
     EXPECT_EQ(Collect(), 0);
     EXPECT_THAT(Log(), LoggedInOrder("Failed to untar " + Quoted(kOutput + ".1.xz")));
     EXPECT_THAT(Delivered(), UnorderedElementsAre(Pair("m", "three\n")));
@@ -950,7 +944,7 @@ TEST(CollectLogTest, DropsAnOldestArchiveThatCannotBeDecompressed) {
 
 TEST(CollectLogTest, DropsAnOldestArchiveWhosePlainCopyCannotBeMeasured) {
   InstallRotated("one\n", {"two\n", "three\n"});
-  FailCall("ALIBCFileStat", 2, -1);
+  On("ALIBCFileStat").Nth(2).Return(-1);
   EXPECT_EQ(Collect(), 0);
   EXPECT_THAT(Log(), LoggedInOrder("Failed to stat file " + Quoted(kOutput + ".1")));
   EXPECT_THAT(Delivered(), UnorderedElementsAre(Pair("m", "three\n")));
@@ -958,8 +952,8 @@ TEST(CollectLogTest, DropsAnOldestArchiveWhosePlainCopyCannotBeMeasured) {
 
 TEST(CollectLogTest, SendsAnArchiveWholeWhosePlainCopyCannotBeOpened) {
   InstallRotated("one\n", {"two\n", "three\n"});
-  FailCall("ALIBCExec", 1, 0);  // so that there is no plain copy
-  FailCall("ALIBCFileStat", 2, 0);
+  On("ALIBCExec").Nth(1).Return(0);  // so that there is no plain copy
+  On("ALIBCFileStat").Nth(2).Return(0);
   EXPECT_EQ(Collect(), 0);
   EXPECT_THAT(Log(), LoggedInOrder("Failed to open file " + Quoted(kOutput + ".1"),
                                    "Failed to collect diff log " + Quoted(kOutput + ".1")));
@@ -969,7 +963,7 @@ TEST(CollectLogTest, SendsAnArchiveWholeWhosePlainCopyCannotBeOpened) {
 
 TEST(CollectLogTest, SendsAnArchiveWholeWhoseStateCannotBeStaged) {
   const std::string conf = InstallRotated("one\n", {"two\n", "three\n"});
-  FailCall("ALIBCSzHashSetValue", 1, -1);
+  On("ALIBCSzHashSetValue").Nth(1).Return(-1);
   EXPECT_EQ(Collect(), 0);
   EXPECT_THAT(Log(), LoggedInOrder(FailedPair("last_hash", Md5("two"), conf),
                                    "Failed to update config of log " + Quoted(kOutput + ".1"),
@@ -981,7 +975,7 @@ TEST(CollectLogTest, FailsWhenTheOldestArchiveCannotBeSentWholeEither) {
   const std::string conf = InstallCollected("one\n");
   WriteFile(kLog, "something else\n");
   Rotate(kLog);
-  FailCall("ARVOFileCopy", 2, -1);
+  On("ARVOFileCopy").Nth(2).Return(-1);
   EXPECT_EQ(Collect(), 0);
   EXPECT_THAT(Log(), LoggedInOrder("Failed to copy " + Quoted(ArchiveOf(kLog, 1)) + " to " +
                                        Quoted(kOutput + ".1.xz"),
@@ -990,7 +984,7 @@ TEST(CollectLogTest, FailsWhenTheOldestArchiveCannotBeSentWholeEither) {
 
 TEST(CollectLogTest, FailsAtTheFirstNewerArchiveThatCannotBeCopied) {
   const std::string conf = InstallRotated("one\n", {"two\n", "three\n", "four\n", "five\n"});
-  FailCall("ARVOFileCopy", 2, -1);
+  On("ARVOFileCopy").Nth(2).Return(-1);
   EXPECT_EQ(Collect(), 0);
   EXPECT_THAT(Log(), LoggedInOrder("Failed to copy " + Quoted(ArchiveOf(kLog, 2)) + " to " +
                                        Quoted(kOutput + ".2.xz"),
@@ -1001,7 +995,7 @@ TEST(CollectLogTest, FailsAtTheFirstNewerArchiveThatCannotBeCopied) {
 
 TEST(CollectLogTest, FailsWhenTheArchivesCannotBeStaged) {
   const std::string conf = InstallRotated("one\n", {"two\n", "three\n"});
-  FailCall("ALIBCSzHashSetValue", 4, -1);
+  On("ALIBCSzHashSetValue").Nth(4).Return(-1);
   EXPECT_EQ(Collect(), 0);
   EXPECT_THAT(Log(), LoggedInOrder(FailedPair("tar_log_inode", Inode(ArchiveOf(kLog, 1)), conf),
                                    FailedTared(conf), FailedIn(conf)));
@@ -1009,8 +1003,8 @@ TEST(CollectLogTest, FailsWhenTheArchivesCannotBeStaged) {
 
 TEST(CollectLogTest, GoesOnWhenScratchCopiesCannotBeRemoved) {
   InstallRotated("one\n", {"two\n", "three\n"});
-  FailCall("ALIBCExec", 1, 1);
-  OnFileCalls().remove = [](const char* path) { return path != kOutput + ".1.xz"; };
+  On("ALIBCExec").Nth(1).Return(1);
+  On("remove").With(kOutput + ".1.xz").Return(-1, EPERM);
   EXPECT_EQ(Collect(), 0);
   EXPECT_THAT(Log(), LoggedInOrder("Failed to untar " + Quoted(kOutput + ".1.xz"),
                                    "Failed to remove " + kOutput +

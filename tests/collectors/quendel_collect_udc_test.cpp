@@ -15,10 +15,9 @@
 #include <thread>
 
 #include "base/json_text.h"
-#include "collectors/file_calls.h"
 #include "quendel.h"
 #include "support/appliance.h"
-#include "support/faults.h"
+#include "support/calls.h"
 #include "support/log.h"
 
 using namespace quendel::test;
@@ -113,12 +112,12 @@ TEST(CollectUDCTest, NeedsTheConfigurationDirectory) {
 }
 
 TEST(CollectUDCTest, GoesOnWhenTheDirectoryCannotBeTold) {
-  FailCall("ALIBCFileCheckDir", 1, -1);
+  On("ALIBCFileCheckDir").Nth(1).Return(-1);
   EXPECT_EQ(Collect(), 0);
 }
 
 TEST(CollectUDCTest, FailsWithoutMemoryForTheNames) {
-  FailCall("ALIBCSzListAlloc", 1, 0);
+  On("ALIBCSzListAlloc").Nth(1).Return(nullptr);
   EXPECT_EQ(Collect(), -1);
   EXPECT_THAT(Log(), LoggedInOrder("Failed to allocate memory for list"));
   EXPECT_FALSE(Exists(kResult));
@@ -126,7 +125,7 @@ TEST(CollectUDCTest, FailsWithoutMemoryForTheNames) {
 
 TEST(CollectUDCTest, FailsWithoutMemoryForTheState) {
   WriteFile(kUpdateFile, "[/x]\nlast_hash=old\n");
-  FailCall("ALIBCSzHashAlloc", 1, 0);
+  On("ALIBCSzHashAlloc").Nth(1).Return(nullptr);
   EXPECT_EQ(Collect(), -1);
   EXPECT_THAT(Log(), LoggedInOrder("Failed to allocate memory for UDC hash"));
   EXPECT_FALSE(Exists(kResult));
@@ -135,7 +134,7 @@ TEST(CollectUDCTest, FailsWithoutMemoryForTheState) {
 
 TEST(CollectUDCTest, FailsWhenTheConfigurationsCannotBeListed) {
   WriteFile(kUpdateFile, "[/x]\nlast_hash=old\n");
-  FailCall("ALIBCFileEnumDir", 1, -1);
+  On("ALIBCFileEnumDir").Nth(1).Return(-1);
   EXPECT_EQ(Collect(), -1);
   EXPECT_THAT(Log(), LoggedInOrder("Failed to enum dir '/usr/arvo/etc/quendel'"));
   EXPECT_FALSE(Exists(kResult));
@@ -167,7 +166,7 @@ TEST(CollectUDCTest, RemovesWhatAnEarlierRunStaged) {
 TEST(CollectUDCTest, GoesOnWhenWhatWasStagedCannotBeRemoved) {
   Install("a", "echo 1");
   WriteFile(kUpdateFile, "");
-  OnFileCalls().remove = [](const char* path) { return path != std::string(kUpdateFile); };
+  On("remove").With(kUpdateFile).Return(-1, EPERM);
   EXPECT_EQ(Collect(), 0);
   EXPECT_THAT(Log(), LoggedInOrder(std::string("Failed to remove ") + kUpdateFile +
                                    " [errno=" + std::to_string(EPERM) + "]"));
@@ -360,7 +359,7 @@ TEST(CollectUDCTest, SendsErrorForOutputThatCannotBeReadToItsEnd) {
   };
   int calls = 0;
   FILE* stream = fopencookie(&calls, "r", functions);
-  FailCall("ALIBCPopen", 1, reinterpret_cast<long>(stream));
+  On("ALIBCPopen").Nth(1).Return(stream);
   EXPECT_EQ(Collect(), 0);
   EXPECT_EQ(Results(), Parsed(R"({"a": "Error"})"));
   EXPECT_THAT(Log(), LoggedInOrder(NoResultOf("a")));
@@ -387,7 +386,7 @@ TEST(CollectUDCTest, GoesOnToTheNextCollectorAfterAFailure) {
 
 TEST(CollectUDCTest, LeavesOutWhatCannotBeRemembered) {
   Install("a", "echo 1");
-  FailCall("ALIBCSzHashSetValue", 1, -1);
+  On("ALIBCSzHashSetValue").Nth(1).Return(-1);
   EXPECT_EQ(Collect(), 0);
   EXPECT_EQ(ReadFile(kResult), "null");
   EXPECT_THAT(Log(), LoggedInOrder("Failed to set hash of conf '" + ConfOf("a") + "' to '" +
@@ -398,7 +397,7 @@ TEST(CollectUDCTest, LeavesOutWhatCannotBeStaged) {
   for (const long answer : {0L, -1L}) {
     ClearLog();
     Install("a", "echo 1");
-    FailCall("ALIBCFileAddSection", 1, answer);
+    On("ALIBCFileAddSection").Nth(1).Return(answer);
     EXPECT_EQ(Collect(), 0);
     EXPECT_EQ(ReadFile(kResult), "null");
     EXPECT_THAT(Log(),

@@ -5,7 +5,7 @@
 
 #include "quendel.h"
 #include "support/appliance.h"
-#include "support/faults.h"
+#include "support/calls.h"
 #include "support/log.h"
 
 using namespace quendel::test;
@@ -102,7 +102,7 @@ TEST(GetLogConfTest, StopsAtTheFirstKeyThatIsMissing) {
                                                          {"inode", "inode"}};
   const std::vector<std::string> before = Fields(Untouched());
   const std::vector<std::string> read = Fields(Read(ConfWithout("")));
-  FailCall("ALIBCErrGet", 0, 1234);
+  On("ALIBCErrGet").Return(1234);
   size_t found = 0;
   for (const auto& [key, words] : missing) {
     ClearLog();

@@ -5,7 +5,7 @@
 
 #include "quendel.h"
 #include "support/appliance.h"
-#include "support/faults.h"
+#include "support/calls.h"
 #include "support/log.h"
 
 using namespace quendel::test;
@@ -21,7 +21,7 @@ constexpr char kConf[] = "/usr/arvo/etc/quendel/quendel.udc.raid";
 std::vector<std::string> FailToRead(const std::string& text) {
   WriteFile(kConf, text);
   QUENDELUDCConf_t conf = {"hash before", "name before", "path before"};
-  FailCall("ALIBCErrGet", 1, 99);
+  On("ALIBCErrGet").Nth(1).Return(99);
   EXPECT_EQ(QUENDELGetUDCConf(kConf, &conf), -1);
   return {conf.name, conf.path, conf.last_hash};
 }

@@ -3,7 +3,7 @@
 
 #include "quendel.h"
 #include "support/appliance.h"
-#include "support/faults.h"
+#include "support/calls.h"
 #include "support/log.h"
 
 using namespace quendel::test;
@@ -48,13 +48,15 @@ TEST(ResetLogConfTest, StopsAtTheFirstKeyThatCannotBeWritten) {
                                                        {"last_byte=\"\"", "last log length"},
                                                        {"total_byte=\"\"", "total byte"},
                                                        {"inode=\"\"", "inode"}};
-  FailCall("ALIBCErrGet", 0, 5);
+  On("ALIBCErrGet").Return(5);
   int nth = 1;
   for (const auto& [reset, words] : steps) {
     ClearLog();
     WriteFile(kConf, kText);
     const int before = Calls("ALIBCFileSetKeyValue");
-    FailCall("ALIBCFileSetKeyValue", nth, nth % 2 == 0 ? 0 : -1);  // neither 0 nor less is success
+    On("ALIBCFileSetKeyValue")
+        .Nth(nth)
+        .Return(nth % 2 == 0 ? 0 : -1);  // neither 0 nor less is success
     EXPECT_EQ(QUENDELResetLogConf(kConf), -1);
     EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to reset " + words + " in conf '" + kConf +
                                                      "', ret = 5")));

@@ -3,7 +3,7 @@
 
 #include "quendel.h"
 #include "support/appliance.h"
-#include "support/faults.h"
+#include "support/calls.h"
 #include "support/log.h"
 
 using namespace quendel::test;
@@ -33,8 +33,8 @@ TEST(ResetUDCConfTest, FailsWhenTheHashCannotBeWritten) {
   for (const long answer : {0L, -1L}) {
     ClearLog();
     WriteFile(kConf, "name=n\nlast_hash=h\npath=/p\n");
-    FailCall("ALIBCFileSetKeyValue", 1, answer);
-    FailCall("ALIBCErrGet", 1, 42);
+    On("ALIBCFileSetKeyValue").Nth(1).Return(answer);
+    On("ALIBCErrGet").Nth(1).Return(42);
     EXPECT_EQ(QUENDELResetUDCConf(kConf), -1);
     EXPECT_THAT(Log(), ElementsAre(Logged("quendel_reset_udc_conf",
                                           std::string("Failed to reset lash hash value in conf '") +

@@ -3,7 +3,7 @@
 
 #include "quendel.h"
 #include "support/appliance.h"
-#include "support/faults.h"
+#include "support/calls.h"
 #include "support/log.h"
 
 using namespace quendel::test;
@@ -72,7 +72,7 @@ TEST(UpdateCollectConfTest, FailsWithoutMemoryForEitherList) {
   for (const int nth : {1, 2}) {
     ClearLog();
     ResetCalls();
-    FailCall("ALIBCSzListAlloc", nth, 0);
+    On("ALIBCSzListAlloc").Nth(nth).Return(nullptr);
     EXPECT_EQ(QUENDELUpdateCollectConf(kUpdateFile), -1);
     EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to allocate memory for list")));
   }
@@ -81,7 +81,7 @@ TEST(UpdateCollectConfTest, FailsWithoutMemoryForEitherList) {
 
 TEST(UpdateCollectConfTest, FailsWithoutMemoryForTheHash) {
   Stage();
-  FailCall("ALIBCSzHashAlloc", 1, 0);
+  On("ALIBCSzHashAlloc").Nth(1).Return(nullptr);
   EXPECT_EQ(QUENDELUpdateCollectConf(kUpdateFile), -1);
   EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to allocate memory for hash")));
   EXPECT_EQ(ReadFile(kFirst), kFresh);
@@ -97,7 +97,7 @@ TEST(UpdateCollectConfTest, AsksForItsContainersInTheirSizes) {
 
 TEST(UpdateCollectConfTest, FailsWhenTheSectionsCannotBeListed) {
   Stage();
-  FailCall("ALIBCFileEnumSection", 1, -1);
+  On("ALIBCFileEnumSection").Nth(1).Return(-1);
   EXPECT_EQ(QUENDELUpdateCollectConf(kUpdateFile), -1);
   EXPECT_THAT(Log(), ElementsAre(Logged(
                          kUnit, std::string("Failed to enum section of '") + kUpdateFile + "'")));
@@ -108,7 +108,7 @@ TEST(UpdateCollectConfTest, PassesOverASectionThatCannotBeRead) {
   for (const long answer : {0L, -1L}) {
     Stage();
     ClearLog();
-    FailCall("ALIBCFileGetSection", 1, answer);
+    On("ALIBCFileGetSection").Nth(1).Return(answer);
     EXPECT_EQ(QUENDELUpdateCollectConf(kUpdateFile), 0);
     EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, std::string("Failed to get key-value pair of "
                                                              "section '") +
@@ -120,7 +120,7 @@ TEST(UpdateCollectConfTest, PassesOverASectionThatCannotBeRead) {
 
 TEST(UpdateCollectConfTest, PassesOverASectionWhoseKeysCannotBeListed) {
   Stage();
-  FailCall("ALIBCSzHashEnumKey", 1, -1);
+  On("ALIBCSzHashEnumKey").Nth(1).Return(-1);
   EXPECT_EQ(QUENDELUpdateCollectConf(kUpdateFile), 0);
   EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, std::string("Failed to enum all key of section '") +
                                                    kFirst + "'")));
@@ -130,8 +130,8 @@ TEST(UpdateCollectConfTest, PassesOverASectionWhoseKeysCannotBeListed) {
 
 TEST(UpdateCollectConfTest, GivesUpOnlyTheSectionWhoseValueCannotBeWritten) {
   Stage();
-  FailCall("ALIBCFileSetKeyValue", 2, -1);
-  FailCall("ALIBCErrGet", 1, 12);
+  On("ALIBCFileSetKeyValue").Nth(2).Return(-1);
+  On("ALIBCErrGet").Nth(1).Return(12);
   EXPECT_EQ(QUENDELUpdateCollectConf(kUpdateFile), 0);
   EXPECT_THAT(Log(), ElementsAre(Logged(
                          kUnit, std::string("Failed to set key-value pair: (last_hash, h1) of "
@@ -143,7 +143,7 @@ TEST(UpdateCollectConfTest, GivesUpOnlyTheSectionWhoseValueCannotBeWritten) {
 
 TEST(UpdateCollectConfTest, GoesOnAfterAWriteThatAnswersZero) {
   Stage();
-  FailCall("ALIBCFileSetKeyValue", 1, 0);
+  On("ALIBCFileSetKeyValue").Nth(1).Return(0);
   EXPECT_EQ(QUENDELUpdateCollectConf(kUpdateFile), 0);
   EXPECT_EQ(ReadFile(kFirst), Committed("h1", "\"\""));
   EXPECT_THAT(Log(), IsEmpty());

@@ -8,7 +8,7 @@
 #include "model/collector_files.h"
 #include "quendel.h"
 #include "support/appliance.h"
-#include "support/faults.h"
+#include "support/calls.h"
 #include "support/log.h"
 
 using namespace quendel::test;
@@ -47,7 +47,7 @@ std::string InstallRotated() {
 std::string ArrivedInSpiteOf(int nth, int answer) {
   InstallRotated();
   ResetCalls();
-  FailCall("ALIBCFileExist", nth, answer, EIO);
+  On("ALIBCFileExist").Nth(nth).Return(answer, EIO);
   std::string arrived;
   Deliver(arrived);
   ResetCalls();
@@ -89,8 +89,8 @@ TEST(CollectLogTest, LosesNoLineOnAPlatformThatTakesAnErrorForAbsence) {
 TEST(CollectLogTest, FailsALogWithAFileThatCannotBeExamined) {
   const std::string conf = InstallRotated();
   ClearLog();
-  FailCall("ALIBCFileExist", 0, -1, EIO);
-  FailCall("ALIBCFileStat", 1, -1, EIO);
+  On("ALIBCFileExist").Return(-1, EIO);
+  On("ALIBCFileStat").Nth(1).Return(-1, EIO);
   EXPECT_EQ(QUENDELCollectLog(kRunFolder), 0);
   EXPECT_THAT(
       Log(),
@@ -104,10 +104,10 @@ TEST(CollectLogTest, FailsALogWithAFileThatCannotBeExamined) {
 TEST(ResetLogConfTest, FailsForAFileThatCannotBeExamined) {
   const std::string conf = InstallRotated();
   const std::string before = ReadFile(conf);
-  FailCall("ALIBCFileExist", 1, -1, EIO);
-  FailCall("ALIBCFileSetKeyValue", 1, -1, EIO);
+  On("ALIBCFileExist").Nth(1).Return(-1, EIO);
+  On("ALIBCFileSetKeyValue").Nth(1).Return(-1, EIO);
   EXPECT_EQ(QUENDELResetLogConf(conf.c_str()), -1);
-  FailCall("ALIBCFileExist", 1, -1, EIO);
+  On("ALIBCFileExist").Nth(1).Return(-1, EIO);
   EXPECT_EQ(QUENDELResetLogConf(conf.c_str()), 0);
   EXPECT_NE(ReadFile(conf), before);
 }
@@ -115,10 +115,10 @@ TEST(ResetLogConfTest, FailsForAFileThatCannotBeExamined) {
 TEST(ResetUDCConfTest, FailsForAFileThatCannotBeExamined) {
   constexpr char kConf[] = "/usr/arvo/etc/quendel/quendel.udc.a";
   WriteFile(kConf, "last_hash=h\n");
-  FailCall("ALIBCFileExist", 1, -1, EIO);
-  FailCall("ALIBCFileSetKeyValue", 1, -1, EIO);
+  On("ALIBCFileExist").Nth(1).Return(-1, EIO);
+  On("ALIBCFileSetKeyValue").Nth(1).Return(-1, EIO);
   EXPECT_EQ(QUENDELResetUDCConf(kConf), -1);
-  FailCall("ALIBCFileExist", 1, -1, EIO);
+  On("ALIBCFileExist").Nth(1).Return(-1, EIO);
   EXPECT_EQ(QUENDELResetUDCConf(kConf), 0);
   EXPECT_EQ(ReadFile(kConf), "last_hash=\"\"\n");
 }
@@ -126,10 +126,10 @@ TEST(ResetUDCConfTest, FailsForAFileThatCannotBeExamined) {
 TEST(UpdateCollectConfTest, CommitsAFileThatCannotBeExamined) {
   const std::string conf = InstallRotated();
   EXPECT_EQ(Collect(), 0);
-  FailCall("ALIBCFileExist", 1, -1, EIO);
+  On("ALIBCFileExist").Nth(1).Return(-1, EIO);
   EXPECT_EQ(QUENDELUpdateCollectConf(kLogUpdateFile), 0);
   EXPECT_EQ(ReadPairs(conf)["total_byte"], "6");
-  FailCall("ALIBCFileExist", 1, -1, EIO);
-  FailCall("ALIBCFileEnumSection", 1, -1, EIO);
+  On("ALIBCFileExist").Nth(1).Return(-1, EIO);
+  On("ALIBCFileEnumSection").Nth(1).Return(-1, EIO);
   EXPECT_EQ(QUENDELUpdateCollectConf(kLogUpdateFile), -1);
 }

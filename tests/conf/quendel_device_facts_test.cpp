@@ -7,7 +7,7 @@
 
 #include "quendel.h"
 #include "support/appliance.h"
-#include "support/faults.h"
+#include "support/calls.h"
 #include "support/log.h"
 
 using namespace quendel::test;
@@ -80,7 +80,7 @@ TEST(GetHMXModelTest, ReleasesThePlatformsLockAfterEveryRead) {
   Record("ALIBCFileUnlock");
   char model[64];
   EXPECT_EQ(QUENDELGetHMXModel(model, sizeof model), 0);
-  FailCall("ALIBCFileGetKeyValue", 1, -7);
+  On("ALIBCFileGetKeyValue").Nth(1).Return(-7);
   EXPECT_EQ(QUENDELGetHMXModel(model, sizeof model), -1);
   EXPECT_THAT(Recorded(), ElementsAre(kRead, "2048", kRead, "2048"));
 }
@@ -131,7 +131,7 @@ TEST(GetHMXVersionTest, MakesRoomForTheWholeFile) {
 }
 
 TEST(GetHMXVersionTest, FailsWhenMemoryRunsOut) {
-  FailCall("ALIBCSzHashAlloc", 1, 0);
+  On("ALIBCSzHashAlloc").Nth(1).Return(nullptr);
   char version[64] = "before";
   EXPECT_EQ(QUENDELGetHMXVersion(version, sizeof version), -1);
   EXPECT_STREQ(version, "before");
@@ -194,7 +194,7 @@ TEST(GetDstDirTest, DoesNotTakeAFileForADirectory) {
 
 TEST(GetDstDirTest, PassesOnThatThePlatformCannotTell) {
   UseTimeZone("UTC0");
-  FailCall("ALIBCFileCheckDir", 1, -1);
+  On("ALIBCFileCheckDir").Nth(1).Return(-1);
   char path[64];
   EXPECT_EQ(QUENDELGetDstDir(path, sizeof path, kMoment), -1);
   EXPECT_STREQ(path, "/tmp/quendel_20240305_070809_0");
@@ -202,7 +202,7 @@ TEST(GetDstDirTest, PassesOnThatThePlatformCannotTell) {
 
 TEST(GetDstDirTest, TakesOnlyOneForATakenName) {
   UseTimeZone("UTC0");
-  FailCall("ALIBCFileCheckDir", 1, 2);
+  On("ALIBCFileCheckDir").Nth(1).Return(2);
   char path[64];
   EXPECT_EQ(QUENDELGetDstDir(path, sizeof path, kMoment), 2);
   EXPECT_STREQ(path, "/tmp/quendel_20240305_070809_0");

@@ -6,7 +6,7 @@
 #include "platform/owned.h"
 #include "quendel.h"
 #include "support/appliance.h"
-#include "support/faults.h"
+#include "support/calls.h"
 #include "support/log.h"
 
 using namespace quendel::test;
@@ -72,7 +72,7 @@ TEST(GetConfTest, LeavesTheRecordAloneWhenTheFileCannotBeRead) {
 }
 
 TEST(GetConfTest, LeavesTheRecordAloneWhenMemoryRunsOut) {
-  FailCall("ALIBCSzHashAlloc", 1, 0);
+  On("ALIBCSzHashAlloc").Nth(1).Return(nullptr);
   QUENDELConf_t conf;
   conf.contact = "before";
   EXPECT_EQ(QUENDELGetConf(&conf), -1);
@@ -83,7 +83,7 @@ TEST(GetConfTest, LeavesTheRecordAloneWhenMemoryRunsOut) {
 
 TEST(GetConfTest, TakesOnlyANegativeAnswerForAFailedRead) {
   EXPECT_EQ(ContactOf(""), kEmptyArray);
-  FailCall("ALIBCFileGetPair", 1, -7);
+  On("ALIBCFileGetPair").Nth(1).Return(-7);
   QUENDELConf_t conf;
   EXPECT_EQ(QUENDELGetConf(&conf), -1);
 }
@@ -128,7 +128,7 @@ TEST(GetServerHostTest, IsTheDefaultWhenTheValueIsEmpty) {
 
 TEST(GetServerHostTest, IsWhateverTextTheReaderFound) {
   Record("ALIBCFileGetKeyValue");
-  FailCall("ALIBCFileGetKeyValue", 1, 5);
+  On("ALIBCFileGetKeyValue").Nth(1).Return(5);
   EXPECT_EQ(QUENDELGetServerHost(), "");
   EXPECT_THAT(Recorded(), ElementsAre("/etc.defaults/arvoinfo.conf|quendel_server|32|0"));
 }
@@ -159,7 +159,7 @@ TEST(IsEnableTest, IsThePlatformsAnswerUnchanged) {
   EXPECT_NE(QUENDELIsEnable(), 0);
   SetIdentity({{"service_quendeld", "no"}});
   EXPECT_EQ(QUENDELIsEnable(), 0);
-  FailCall("ALIBServiceIsEnabled", 1, 7);
+  On("ALIBServiceIsEnabled").Nth(1).Return(7);
   EXPECT_EQ(QUENDELIsEnable(), 7);
 }
 

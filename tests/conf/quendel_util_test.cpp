@@ -6,7 +6,7 @@
 
 #include "quendel.h"
 #include "support/appliance.h"
-#include "support/faults.h"
+#include "support/calls.h"
 #include "support/log.h"
 
 using namespace quendel::test;
@@ -60,9 +60,9 @@ TEST(FileCopyTest, SetsTwoFlagsOfThePlatformsOptions) {
 }
 
 TEST(FileCopyTest, PassesThePlatformsAnswerOnInSilence) {
-  FailCall("ARVOFileCopy", 1, -42);
+  On("ARVOFileCopy").Nth(1).Return(-42);
   EXPECT_EQ(QUENDELFileCopy("/tmp/from", "/tmp/to"), -42);
-  FailCall("ARVOFileCopy", 1, 7);
+  On("ARVOFileCopy").Nth(1).Return(7);
   EXPECT_EQ(QUENDELFileCopy("/tmp/from", "/tmp/to"), 7);
   EXPECT_LT(QUENDELFileCopy("/tmp/missing", "/tmp/to"), 0);
   EXPECT_THAT(Log(), IsEmpty());
@@ -77,7 +77,7 @@ TEST(RecursiveMkdirTest, RunsTheToolWithThePathBeforeTheMode) {
 
 TEST(RecursiveMkdirTest, WritesTheModeInOctalWithoutALeadingZero) {
   Record("ALIBCExec");
-  FailCall("ALIBCExec", 0, 0);
+  On("ALIBCExec").Return(0);
   QUENDELRecursiveMkdir("/x", 0755);
   QUENDELRecursiveMkdir("/x", 01777);
   QUENDELRecursiveMkdir("/x", 0);
@@ -94,14 +94,14 @@ TEST(RecursiveMkdirTest, RunsNothingForTheCurrentDirectoryAndTheRoot) {
 
 TEST(RecursiveMkdirTest, PassesOnOtherSpellingsOfThem) {
   Record("ALIBCExec");
-  FailCall("ALIBCExec", 0, 0);
+  On("ALIBCExec").Return(0);
   QUENDELRecursiveMkdir("./", 0755);
   QUENDELRecursiveMkdir("//", 0755);
   EXPECT_THAT(Recorded(), ElementsAre("/bin/mkdir|-p|./|-m|755", "/bin/mkdir|-p|//|-m|755"));
 }
 
 TEST(RecursiveMkdirTest, FailsOnlyWhenTheToolCannotBeRun) {
-  FailCall("ALIBCExec", 1, -1);
+  On("ALIBCExec").Nth(1).Return(-1);
   EXPECT_EQ(QUENDELRecursiveMkdir("/tmp/a", 0755), -1);
   EXPECT_FALSE(Exists("/tmp/a"));
   WriteFile("/tmp/file", "");
@@ -110,7 +110,7 @@ TEST(RecursiveMkdirTest, FailsOnlyWhenTheToolCannotBeRun) {
 }
 
 TEST(RecursiveMkdirTest, TakesOnlyMinusOneForAToolThatCannotBeRun) {
-  FailCall("ALIBCExec", 1, -2);
+  On("ALIBCExec").Nth(1).Return(-2);
   EXPECT_EQ(QUENDELRecursiveMkdir("/tmp/a", 0755), 0);
 }
 
@@ -136,17 +136,17 @@ TEST(RecursiveRmdirTest, RunsNothingForTheCurrentDirectoryAndTheRoot) {
 
 TEST(RecursiveRmdirTest, PassesOnOtherSpellingsOfThem) {
   Record("ALIBCExec");
-  FailCall("ALIBCExec", 0, 0);
+  On("ALIBCExec").Return(0);
   QUENDELRecursiveRmdir("./");
   QUENDELRecursiveRmdir("//");
   EXPECT_THAT(Recorded(), ElementsAre("/bin/rm|-f|-r|./", "/bin/rm|-f|-r|//"));
 }
 
 TEST(RecursiveRmdirTest, FailsOnlyWhenTheToolCannotBeRun) {
-  FailCall("ALIBCExec", 1, -1);
+  On("ALIBCExec").Nth(1).Return(-1);
   EXPECT_EQ(QUENDELRecursiveRmdir("/tmp/a"), -1);
   for (int answer : {1, -2}) {
-    FailCall("ALIBCExec", 1, answer);
+    On("ALIBCExec").Nth(1).Return(answer);
     EXPECT_EQ(QUENDELRecursiveRmdir("/tmp/a"), 0) << answer;
   }
   EXPECT_THAT(Log(), IsEmpty());

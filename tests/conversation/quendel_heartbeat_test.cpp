@@ -3,7 +3,7 @@
 
 #include "quendel.h"
 #include "support/appliance.h"
-#include "support/faults.h"
+#include "support/calls.h"
 #include "support/json.h"
 #include "support/log.h"
 #include "support/server.h"
@@ -97,11 +97,11 @@ TEST(HeartbeatTest, FailsWithoutASerialNumber) {
 }
 
 TEST(HeartbeatTest, TakesOnlyANegativeAnswerForAMissingSerialNumber) {
-  FailCall("ALIBGetSerialNumber", 1, 1);
+  On("ALIBGetSerialNumber").Nth(1).Return(1);
   Json::Value actions;
   EXPECT_EQ(QUENDELHeartbeat(actions), 0);
   EXPECT_EQ(Requests().at(0).line, "POST /heartbeat/ HTTP/1.1");
-  FailCall("ALIBGetSerialNumber", 1, -7);
+  On("ALIBGetSerialNumber").Nth(1).Return(-7);
   ExpectFailure();
 }
 

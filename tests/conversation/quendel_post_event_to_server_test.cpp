@@ -5,7 +5,7 @@
 
 #include "quendel.h"
 #include "support/appliance.h"
-#include "support/faults.h"
+#include "support/calls.h"
 #include "support/json.h"
 #include "support/log.h"
 #include "support/server.h"
@@ -120,7 +120,7 @@ TEST(PostEventToServerTest, RefusesAValueThatIsNoEvent) {
 }
 
 TEST(PostEventToServerTest, FailsWithoutMemoryBeforeItLooksAtTheEvent) {
-  FailCall("calloc", 1, 0);
+  On("calloc").Nth(1).Return(nullptr);
   ExpectRefusal(6, "Failed to malloc for pMyhubAccount");
   EXPECT_THAT(Log(), testing::SizeIs(1));
 }

@@ -5,7 +5,7 @@
 
 #include "quendel.h"
 #include "support/appliance.h"
-#include "support/faults.h"
+#include "support/calls.h"
 #include "support/json.h"
 #include "support/log.h"
 #include "support/server.h"
@@ -69,10 +69,10 @@ TEST(UpdateActRequestProgressTest, LeavesTheSegmentsOfEmptyFieldsEmpty) {
 
 TEST(UpdateActRequestProgressTest, TakesOnlyANegativeAnswerForAMissingAccount) {
   SetIdentity();
-  FailCall("ARVOMYHUBAccountGet", 1, 1);
+  On("ARVOMYHUBAccountGet").Nth(1).Return(1);
   EXPECT_EQ(Report(17, 0), 0);
   EXPECT_EQ(RequestLine(), "POST /action_progress/17/0///S1 HTTP/1.1");
-  FailCall("ARVOMYHUBAccountGet", 1, -7);
+  On("ARVOMYHUBAccountGet").Nth(1).Return(-7);
   EXPECT_EQ(Report(17, 0), -1);
 }
 
@@ -84,7 +84,7 @@ TEST(UpdateActRequestProgressTest, AsksThePlatformForOneWholeRecord) {
 }
 
 TEST(UpdateActRequestProgressTest, FailsWithoutMemoryBeforeAnythingElse) {
-  FailCall("calloc", 1, 0);
+  On("calloc").Nth(1).Return(nullptr);
   EXPECT_EQ(Report(17, 0), -1);
   EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to malloc for pMyhubAccount")));
   EXPECT_EQ(Calls("ALIBGetSerialNumber"), 0);

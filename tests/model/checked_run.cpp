@@ -12,7 +12,7 @@
 #include "model/xz.h"
 #include "quendel.h"
 #include "support/appliance.h"
-#include "support/faults.h"
+#include "support/calls.h"
 #include "support/log.h"
 
 namespace quendel::test {
@@ -137,7 +137,7 @@ CheckedRun CollectAndCompare(const std::vector<std::string>& folders, const Mode
   ClearLog();
   if (!fault.call.empty()) {
     const bool givesPointer = fault.call.find("lloc") != std::string::npos;
-    FailCall(fault.call.c_str(), fault.nth, givesPointer ? 0 : -1);
+    On(fault.call.c_str()).Nth(fault.nth).Return(givesPointer ? 0 : -1);
   }
   const int result = QUENDELCollectLog(kRunFolder);
   ResetCalls();
@@ -180,8 +180,8 @@ std::string CommitAndCompare(int failing) {
   }
   ClearLog();
   if (failing > 0) {
-    FailCall("ALIBCFileSetKeyValue", failing, -1);
-    FailCall("ALIBCErrGet", 0, 77);
+    On("ALIBCFileSetKeyValue").Nth(failing).Return(-1);
+    On("ALIBCErrGet").Return(77);
   }
   const int result = QUENDELUpdateCollectConf(kLogUpdateFile);
   ResetCalls();

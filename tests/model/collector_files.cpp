@@ -2,14 +2,17 @@
 #include "model/collector_files.h"
 
 #include <gmock/gmock.h>
+#include <sys/stat.h>
 
 #include <filesystem>
 #include <fstream>
 #include <sstream>
 
 #include "model/xz.h"
+#include "platform/file.h"
 #include "quendel.h"
 #include "support/appliance.h"
+#include "support/calls.h"
 #include "support/log.h"
 
 namespace quendel::test {
@@ -85,6 +88,25 @@ void Rotate(const std::string& log) {
 void CopyTruncate(const std::string& log) {
   PushArchive(log, ReadFile(log));
   fs::resize_file(log, 0);
+}
+
+void ShowInode(const std::string& path, uint64_t inode) {
+  On("stat").Anywhere().With(path).Replace([inode](const char* given, struct stat* status) {
+    const int result = stat(given, status);
+    status->st_ino = inode;
+    return result;
+  });
+}
+
+void OnceMeasured(const std::string& path, std::function<void()> action) {
+  On("ALIBCFileStat")
+      .With(path)
+      .Nth(1)
+      .Replace([action = std::move(action)](const char* given, int flags, struct stat* status) {
+        const int result = ALIBCFileStat(given, flags, status);
+        action();
+        return result;
+      });
 }
 
 int Collect() {

@@ -3,6 +3,8 @@
 #ifndef TESTS_MODEL_COLLECTOR_FILES_H_
 #define TESTS_MODEL_COLLECTOR_FILES_H_
 
+#include <cstdint>
+#include <functional>
 #include <map>
 #include <string>
 #include <utility>
@@ -34,6 +36,12 @@ void CopyTruncate(const std::string& log);
 
 // The path of a log's archive.
 std::string ArchiveOf(const std::string& log, int number);
+
+// Gives a path this inode number from now on, whatever file is there.
+void ShowInode(const std::string& path, uint64_t inode);
+
+// Has something happen once, as soon as the collector has learned the size and inode of this file.
+void OnceMeasured(const std::string& path, std::function<void()> action);
 
 // Collects into an emptied run folder. Returns the collector's result.
 int Collect();

@@ -17,7 +17,7 @@
 #include "platform/local_account.h"
 #include "platform/process.h"
 #include "support/appliance.h"
-#include "support/faults.h"
+#include "support/calls.h"
 
 using namespace quendel::test;
 
@@ -190,15 +190,15 @@ TEST(APIRunnerTest, TakesAServiceThatEndsByItselfForStopped) {
   }
   prctl(PR_SET_NAME, "test");
   WriteFile(kPidFile, std::to_string(sshd) + "\n");
-  FailCall("platform:kill", 1, -1, ESRCH);
+  On("kill").InPlatform().Nth(1).Return(-1, ESRCH);
   EXPECT_EQ(CodeOf(Call(EnableSsh(false))), 0);
-  EXPECT_EQ(Calls("platform:kill"), 1);
+  EXPECT_EQ(CallsInPlatform("kill"), 1);
 }
 
 TEST(APIRunnerTest, FailsWhenTheServiceCannotBeStopped) {
   prctl(PR_SET_NAME, "sshd");
   WriteFile(kPidFile, std::to_string(getpid()) + "\n");
-  FailCall("platform:kill", 1, -1, EPERM);
+  On("kill").InPlatform().Nth(1).Return(-1, EPERM);
   EXPECT_EQ(CodeOf(Call(EnableSsh(false))), 500);
 }
 

@@ -10,23 +10,12 @@
 #include <random>
 #include <string>
 
-#include "failing_call.h"
 #include "platform/error.h"
 #include "platform/file.h"
 #include "support/appliance.h"
+#include "support/calls.h"
 
 using namespace quendel::test;
-
-QUENDEL_FAILING_CALL(ssize_t, copy_file_range,
-                     (int from, off_t* fromPlace, int to, off_t* toPlace, size_t size,
-                      unsigned flags),
-                     from, fromPlace, to, toPlace, size, flags)
-QUENDEL_FAILING_CALL(off_t, lseek, (int fd, off_t place, int from), fd, place, from)
-QUENDEL_FAILING_CALL(ssize_t, pread, (int fd, void* buf, size_t size, off_t place), fd, buf, size,
-                     place)
-QUENDEL_FAILING_CALL(ssize_t, sendfile, (int to, int from, off_t* place, size_t size), to, from,
-                     place, size)
-QUENDEL_FAILING_CALL(ssize_t, write, (int fd, const void* buf, size_t size), fd, buf, size)
 
 namespace {
 
@@ -167,14 +156,15 @@ TEST(FileCopyTest, ReadsAndWritesWhereTheKernelCannotCopy) {
   const std::string bytes = RandomBytes(700000);
   WriteFile(kFrom, bytes);
   for (const int reason : {EXDEV, EINVAL, ENOSYS, EOPNOTSUPP, EPERM, EIO, EINTR}) {
-    copy_file_rangeCalls.Fail(0, -1, reason == EINTR ? EXDEV : reason);
-    sendfileCalls.Fail(reason == EINTR ? 1 : 0, -1, reason);
+    ResetCalls();
+    On("copy_file_range").InPlatform().Return(-1, reason == EINTR ? EXDEV : reason);
+    On("sendfile").InPlatform().Nth(reason == EINTR ? 1 : 0).Return(-1, reason);
     EXPECT_EQ(Copy(), 0);
     EXPECT_TRUE(ReadFile(kTo) == bytes) << reason;
   }
   // Some file systems tell nothing but that they copied nothing.
-  copy_file_rangeCalls.Fail(0, 0);
-  sendfileCalls.Fail(0, 0);
+  On("copy_file_range").InPlatform().Return(0);
+  On("sendfile").InPlatform().Return(0);
   EXPECT_EQ(Copy(), 0);
   EXPECT_TRUE(ReadFile(kTo) == bytes);
 }
@@ -182,20 +172,20 @@ TEST(FileCopyTest, ReadsAndWritesWhereTheKernelCannotCopy) {
 TEST(FileCopyTest, CopiesInTheKernelWhereItCan) {
   WriteFile(kFrom, RandomBytes(700000));
   EXPECT_EQ(Copy(), 0);
-  EXPECT_GT(copy_file_rangeCalls.calls(), 0);
-  EXPECT_EQ(preadCalls.calls(), 0);
+  EXPECT_GT(CallsInPlatform("copy_file_range"), 0);
+  EXPECT_EQ(CallsInPlatform("pread"), 0);
 }
 
 TEST(FileCopyTest, IsNotDisturbedBySignals) {
   const std::string bytes = RandomBytes(700000);
   WriteFile(kFrom, bytes);
-  copy_file_rangeCalls.Fail(1, -1, EINTR);
+  On("copy_file_range").InPlatform().Nth(1).Return(-1, EINTR);
   EXPECT_EQ(Copy(), 0);
   EXPECT_TRUE(ReadFile(kTo) == bytes);
-  copy_file_rangeCalls.Fail(0, -1, EXDEV);
-  sendfileCalls.Fail(0, -1, EINVAL);
-  preadCalls.Fail(2, -1, EINTR);
-  writeCalls.Fail(2, -1, EINTR);
+  On("copy_file_range").InPlatform().Return(-1, EXDEV);
+  On("sendfile").InPlatform().Return(-1, EINVAL);
+  On("pread").InPlatform().Nth(2).Return(-1, EINTR);
+  On("write").InPlatform().Nth(2).Return(-1, EINTR);
   EXPECT_EQ(Copy(), 0);
   EXPECT_TRUE(ReadFile(kTo) == bytes);
 }
@@ -203,17 +193,17 @@ TEST(FileCopyTest, IsNotDisturbedBySignals) {
 TEST(FileCopyTest, CopiesWhereTheFileSystemKnowsNoHoles) {
   const std::string bytes = RandomBytes(700000);
   WriteFile(kFrom, bytes);
-  lseekCalls.Fail(1, -1, EINVAL);
+  On("lseek").InPlatform().Nth(1).Return(-1, EINVAL);
   EXPECT_EQ(Copy(), 0);
   EXPECT_TRUE(ReadFile(kTo) == bytes);
 }
 
 TEST(FileCopyTest, EndsWhereASourceThatShrankEnds) {
   WriteFile(kFrom, RandomBytes(700000));
-  lseekCalls.Fail(1, -1, EINVAL);
-  copy_file_rangeCalls.Fail(0, -1, EXDEV);
-  sendfileCalls.Fail(0, -1, EINVAL);
-  preadCalls.Fail(1, 0);  // the end, earlier than the size told
+  On("lseek").InPlatform().Nth(1).Return(-1, EINVAL);
+  On("copy_file_range").InPlatform().Return(-1, EXDEV);
+  On("sendfile").InPlatform().Return(-1, EINVAL);
+  On("pread").InPlatform().Nth(1).Return(0);  // the end, earlier than the size told
   EXPECT_EQ(Copy(), 0);
   EXPECT_EQ(StatusOf(kTo).st_size, 0);
 }

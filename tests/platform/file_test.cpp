@@ -11,20 +11,14 @@
 #include <vector>
 
 #include "containers.h"
-#include "failing_call.h"
 #include "platform/error.h"
 #include "platform/owned.h"
 #include "support/appliance.h"
+#include "support/calls.h"
 
 using namespace quendel::test;
 using testing::ElementsAre;
 using testing::IsEmpty;
-
-QUENDEL_FAILING_CALL(int, mkdirat, (int directory, const char* name, mode_t mode), directory, name,
-                     mode)
-QUENDEL_FAILING_CALL(int, utimensat,
-                     (int directory, const char* name, const timespec* times, int flags), directory,
-                     name, times, flags)
 
 namespace {
 
@@ -158,7 +152,7 @@ TEST(FileTouchTest, SetsTheTimesOfWhatIsThere) {
 
 TEST(FileTouchTest, TakesAFileThatSomebodyElseCreatesMeanwhile) {
   WriteFile("/tmp/file", "kept");
-  utimensatCalls.Fail(1, -1, ENOENT);  // as long as it was not there
+  On("utimensat").InPlatform().Nth(1).Return(-1, ENOENT);  // as long as it was not there
   EXPECT_EQ(ALIBCFileTouch("/tmp/file"), 0);
   EXPECT_EQ(ReadFile("/tmp/file"), "kept");
 }
@@ -315,7 +309,7 @@ TEST(FSMkdirPTest, FollowsALinkToADirectory) {
 }
 
 TEST(FSMkdirPTest, TakesADirectoryThatSomebodyElseMakesMeanwhile) {
-  mkdiratCalls.BeforeNext([] { mkdir("/tmp/a", 0750); });
+  On("mkdirat").InPlatform().Nth(1).Before([] { mkdir("/tmp/a", 0750); });
   EXPECT_EQ(MakePath("/tmp/a/b", 0700), 0);
   EXPECT_EQ(ModeOf("/tmp/a"), 0750U);
   EXPECT_EQ(ModeOf("/tmp/a/b"), 0700U);

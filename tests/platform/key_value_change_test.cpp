@@ -17,18 +17,15 @@
 #include <vector>
 
 #include "containers.h"
-#include "failing_call.h"
 #include "platform/error.h"
 #include "platform/key_value.h"
 #include "platform/owned.h"
 #include "support/appliance.h"
+#include "support/calls.h"
 
 using namespace quendel::test;
 using testing::ElementsAre;
 using testing::IsEmpty;
-
-QUENDEL_FAILING_CALL(int, fsync, (int fd), fd)
-QUENDEL_FAILING_CALL(int, flock, (int fd, int operation), fd, operation)
 
 namespace {
 
@@ -341,7 +338,7 @@ TEST(FileSetKeyValueTest, LeavesTheOldFileInAReadOnlyDirectory) {
 
 TEST(FileSetKeyValueTest, LeavesTheOldFileWhenTheNewOneCannotBeSynchronised) {
   WriteFile(kPath, "key=old\n");
-  fsyncCalls.Fail(1, -1, EIO);
+  On("fsync").InPlatform().Nth(1).Return(-1, EIO);
   EXPECT_EQ(Set("key", "new"), -1);
   EXPECT_EQ(ALIBCErrGet(), 0x0600);
   EXPECT_EQ(errno, EIO);
@@ -351,19 +348,19 @@ TEST(FileSetKeyValueTest, LeavesTheOldFileWhenTheNewOneCannotBeSynchronised) {
 
 TEST(FileSetKeyValueTest, TellsThatTheFolderCouldNotBeSynchronised) {
   WriteFile(kPath, "key=old\n");
-  fsyncCalls.Fail(2, -1, EIO);
+  On("fsync").InPlatform().Nth(2).Return(-1, EIO);
   EXPECT_EQ(Set("key", "new"), -1);
   EXPECT_EQ(ALIBCErrGet(), 0x0601);
   EXPECT_EQ(ReadFile(kPath), "key=new\n");
   // What is not written again is synchronised all the same.
-  fsyncCalls.Fail(1, -1, EIO);
+  On("fsync").InPlatform().Nth(1).Return(-1, EIO);
   EXPECT_EQ(Set("key", "new"), -1);
   EXPECT_EQ(ALIBCErrGet(), 0x0601);
 }
 
 TEST(FileSetKeyValueTest, TakesAFileSystemThatCannotSynchroniseFolders) {
   WriteFile(kPath, "key=old\n");
-  fsyncCalls.Fail(2, -1, EINVAL);
+  On("fsync").InPlatform().Nth(2).Return(-1, EINVAL);
   EXPECT_EQ(Set("key", "new"), 1);
 }
 
@@ -380,7 +377,7 @@ TEST(FileSetKeyValueTest, LeavesTheOldFileWhenTheNewOneCannotTakeItsPlace) {
 
 TEST(FileSetKeyValueTest, FailsWithoutALock) {
   WriteFile(kPath, "key=old\n");
-  flockCalls.Fail(1, -1, ENOLCK);
+  On("flock").InPlatform().Nth(1).Return(-1, ENOLCK);
   EXPECT_EQ(Set("key", "new"), -1);
   EXPECT_EQ(ALIBCErrGet(), 0x0500);
   EXPECT_EQ(errno, ENOLCK);
@@ -495,7 +492,7 @@ TEST(FileSetKeyValueTest, ReleasesALockThatAChildHasInherited) {
   WriteFile(kPath, "key=old\n");
   int lock = -1;
   pid_t child = -1;
-  fsyncCalls.BeforeNext([&] {
+  On("fsync").InPlatform().Nth(1).Before([&] {
     lock = open("/tmp/settings/.test.conf.lock", O_RDWR | O_CLOEXEC);
     child = InChild([] { pause(); });
   });

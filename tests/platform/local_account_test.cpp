@@ -15,18 +15,16 @@
 #include <thread>
 #include <vector>
 
-#include "failing_call.h"
 #include "platform/error.h"
 #include "platform/process.h"
 #include "support/appliance.h"
-#include "support/faults.h"
+#include "support/calls.h"
 
 using namespace quendel::test;
 using testing::HasSubstr;
 using testing::Not;
 
 // Ends each look at the list of processes.
-QUENDEL_FAILING_CALL(int, closedir, (DIR * stream), stream)
 
 namespace {
 
@@ -280,7 +278,7 @@ TEST(LocalAccountUserDeleteTest, EndsSessionsThatBeginMeanwhile) {
   ASSERT_EQ(Prepare("support1"), 0);
   const pid_t session = StartAs(kSupportUid, PauseForEver);
   pid_t late = 0;
-  closedirCalls.BeforeNext([&] { late = StartAs(kSupportUid, PauseForEver); });
+  On("closedir").InPlatform().Nth(1).Before([&] { late = StartAs(kSupportUid, PauseForEver); });
   Result result;
   EXPECT_EQ(Delete("support1", result), 0);
   EXPECT_EQ(EndOf(session), SIGKILL);
@@ -294,7 +292,7 @@ TEST(LocalAccountUserDeleteTest, DoesNotWaitForProcessesThatHaveEnded) {
   AwaitEndOfFirstThread(session);
   Result result;
   EXPECT_EQ(Delete("support1", result), 0);
-  EXPECT_EQ(closedirCalls.calls(), 1);
+  EXPECT_EQ(CallsInPlatform("closedir"), 1);
   EXPECT_EQ(EndOf(session), 0);
 }
 
@@ -313,10 +311,10 @@ TEST(LocalAccountUserDeleteTest, EndsAProcessWhoseFirstThreadHasEnded) {
 TEST(LocalAccountUserDeleteTest, GivesUpOnSessionsThatDoNotEnd) {
   ASSERT_EQ(Prepare("support1"), 0);
   const pid_t session = StartAs(kSupportUid, PauseForEver);
-  FailCall("platform:kill", 0, -1, EPERM);
+  On("kill").InPlatform().Return(-1, EPERM);
   Result result;
   EXPECT_EQ(Delete("support1", result), 0);
-  EXPECT_EQ(closedirCalls.calls(), 10);
+  EXPECT_EQ(CallsInPlatform("closedir"), 10);
   EXPECT_EQ(EndOf(session), SIGTERM);
 }
 

@@ -15,7 +15,7 @@
 
 #include "platform/error.h"
 #include "support/appliance.h"
-#include "support/faults.h"
+#include "support/calls.h"
 
 using namespace quendel::test;
 using testing::HasSubstr;
@@ -415,7 +415,7 @@ TEST(ProcForkExTest, ForksLikeFork) {
 }
 
 TEST(ProcForkExTest, FailsLikeFork) {
-  FailCall("platform:fork", 1, -1, EAGAIN);
+  On("fork").InPlatform().Nth(1).Return(-1, EAGAIN);
   EXPECT_LT(ALIBCProcForkEx(187), 0);
   EXPECT_EQ(ALIBCErrGet(), 0x0800);
   EXPECT_EQ(errno, EAGAIN);

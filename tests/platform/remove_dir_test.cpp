@@ -15,19 +15,13 @@
 #include "platform/error.h"
 #include "platform/file.h"
 #include "support/appliance.h"
+#include "support/calls.h"
 
 using namespace quendel::test;
 
 namespace {
 
 constexpr char kTree[] = "/tmp/tree";
-
-// What somebody else does, once, just before something is opened by this name in its directory.
-struct Meanwhile {
-  std::string name;
-  std::function<void()> action;
-};
-Meanwhile meanwhile;
 
 // Makes a directory inside a directory inside ..., and leaves the process where it was.
 void MakeChain(int depth) {
@@ -48,18 +42,6 @@ void LimitTo(int resource, rlim_t limit) {
 }
 
 }  // namespace
-
-extern "C" int __real_openat(int directory, const char* name, int flags, ...);
-extern "C" int __wrap_openat(int directory, const char* name, int flags, ...) {
-  if (meanwhile.action && meanwhile.name == name) {
-    std::exchange(meanwhile.action, nullptr)();
-  }
-  va_list rest;
-  va_start(rest, flags);
-  const mode_t mode = (flags & O_CREAT) != 0 ? va_arg(rest, mode_t) : 0;
-  va_end(rest);
-  return __real_openat(directory, name, flags, mode);
-}
 
 TEST(RemoveDirTest, RemovesEverythingBelow) {
   WriteFile("/tmp/tree/a/b/file", "1");
@@ -168,7 +150,7 @@ TEST(RemoveDirTest, LeavesAMountedFileSystemAlone) {
 TEST(RemoveDirTest, PassesOverADirectoryThatSomebodyElseRemoves) {
   WriteFile("/tmp/tree/a/file", "");
   mkdir("/tmp/tree/a/b", 0700);
-  meanwhile = {"b", [] { rmdir("/tmp/tree/a/b"); }};
+  On("openat").InPlatform().With("b").Nth(1).Before([] { rmdir("/tmp/tree/a/b"); });
   EXPECT_EQ(ALIBCopyRemoveDir(kTree), 0);
   EXPECT_FALSE(Exists(kTree));
 }
@@ -176,7 +158,8 @@ TEST(RemoveDirTest, PassesOverADirectoryThatSomebodyElseRemoves) {
 TEST(RemoveDirTest, DoesNotFollowADirectoryThatSomebodyMoves) {
   WriteFile("/tmp/tree/a/b/file", "");
   mkdir("/tmp/outside", 0700);
-  meanwhile = {"..", [] { rename("/tmp/tree/a/b", "/tmp/outside/b"); }};
+  On("openat").InPlatform().With("..").Nth(1).Before(
+      [] { rename("/tmp/tree/a/b", "/tmp/outside/b"); });
   EXPECT_LT(ALIBCopyRemoveDir(kTree), 0);
   EXPECT_EQ(errno, ESTALE);
   EXPECT_TRUE(Exists("/tmp/outside/b"));

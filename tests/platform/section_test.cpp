@@ -13,19 +13,16 @@
 #include <vector>
 
 #include "containers.h"
-#include "failing_call.h"
 #include "platform/error.h"
 #include "platform/key_value.h"
 #include "platform/owned.h"
 #include "support/appliance.h"
+#include "support/calls.h"
 
 using namespace quendel::test;
 using testing::ElementsAre;
 using testing::IsEmpty;
 using testing::Pair;
-
-QUENDEL_FAILING_CALL(int, flock, (int fd, int operation), fd, operation)
-QUENDEL_FAILING_CALL(int, ftruncate, (int fd, off_t size), fd, size)
 
 namespace {
 
@@ -160,7 +157,7 @@ TEST(FileAddSectionTest, SaysWhenAPartCannotBeTakenBack) {
   mkdir(kDir, 0700);
   ASSERT_EQ(mount("small", kDir, "tmpfs", 0, "size=4k"), 0);
   ASSERT_GT(Add("a", {{"x", std::string(3000, 'x')}}), 0);
-  ftruncateCalls.Fail(1, -1, EROFS);
+  On("ftruncate").InPlatform().Nth(1).Return(-1, EROFS);
   EXPECT_LT(Add("b", {{"y", std::string(3000, 'y')}}), 0);
   EXPECT_EQ(ALIBCErrGet(), 0x0600);
   EXPECT_EQ(errno, EIO);
@@ -168,7 +165,7 @@ TEST(FileAddSectionTest, SaysWhenAPartCannotBeTakenBack) {
 }
 
 TEST(FileAddSectionTest, FailsWithoutALock) {
-  flockCalls.Fail(1, -1, ENOLCK);
+  On("flock").InPlatform().Nth(1).Return(-1, ENOLCK);
   EXPECT_LT(Add("a", kState), 0);
   EXPECT_EQ(ALIBCErrGet(), 0x0500);
   EXPECT_FALSE(Exists(kPath));

@@ -7,11 +7,9 @@
 
 #include <utility>
 
-#include "support/faults.h"
+#include "support/calls.h"
+#include "support/own_work.h"
 #include "support/require.h"
-
-// The test's own calls of socket() are counted; this one is not among them.
-extern "C" int __real_socket(int domain, int type, int protocol);
 
 namespace quendel::test {
 namespace {
@@ -22,11 +20,12 @@ constexpr uint16_t kPort = 51790;
 constexpr int kBacklog = 16;
 
 int Listen() {
+  const OwnWork ownWork;  // a test counts the sockets
   sockaddr_in address = {};
   address.sin_family = AF_INET;
   address.sin_port = htons(kPort);
   address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-  const int listener = __real_socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
+  const int listener = socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
   const int on = 1;
   setsockopt(listener, SOL_SOCKET, SO_REUSEADDR, &on, sizeof on);
   Require(bind(listener, reinterpret_cast<const sockaddr*>(&address), sizeof address) == 0 &&
@@ -39,14 +38,14 @@ int Listen() {
 
 AcceptPattern::AcceptPattern(std::string pattern) : pattern_(std::move(pattern)) {
   Apply();
-  OnSleep([this] {
+  On("sleep").Before([this] {
     ++attempt_;
     Apply();
   });
 }
 
 AcceptPattern::~AcceptPattern() {
-  OnSleep(nullptr);
+  Restore("sleep");
   if (listener_ >= 0) {
     close(listener_);
   }

@@ -6,7 +6,7 @@
 #include <sys/socket.h>
 #include <unistd.h>
 
-#include "support/faults.h"
+#include "support/calls.h"
 
 using namespace quendel::test;
 

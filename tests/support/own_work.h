@@ -4,8 +4,8 @@
 
 namespace quendel::test {
 
-// The calling thread does work of the kit while one of these lives. A test that lets allocations
-// fail spares those.
+// The calling thread does work of the kit while one of these lives. Its calls are not counted, and
+// neither they nor its allocations fail.
 class OwnWork {
  public:
   OwnWork() { ++depth; }

@@ -10,11 +10,14 @@ namespace quendel::test {
 
 // Ends the program with a sentence when something that a test stands on is missing: going on would
 // prove nothing.
-inline void Require(bool holds, const std::string& otherwise) {
+inline void Require(bool holds, const char* otherwise) {
   if (!holds) {
-    fprintf(stderr, "test kit: %s\n", otherwise.c_str());
+    fprintf(stderr, "test kit: %s\n", otherwise);
     abort();
   }
+}
+inline void Require(bool holds, const std::string& otherwise) {
+  Require(holds, otherwise.c_str());
 }
 
 }  // namespace quendel::test

@@ -1,6 +1,7 @@
 // Allocations that fail on demand.
 #include "support/scarce_memory.h"
 
+#include <dlfcn.h>
 #include <gtest/gtest.h>
 
 #include <cstdlib>
@@ -13,8 +14,8 @@
 namespace quendel::test {
 namespace {
 
-long left =
-    -1;  // allocations up to and with the one that is to fail; negative: there is no such one
+// Allocations up to and with the one that is to fail; negative: there is no such one.
+long left = -1;
 
 bool Fails() {
   return left > 0 && !OwnWork::goes_on() && --left == 0;
@@ -50,18 +51,13 @@ void WithEachAllocationFailing(const std::function<int()>& work,
 
 }  // namespace quendel::test
 
+// The library's own operator new behind this one, or a sanitizer's.
 void* operator new(size_t size) {
-  void* memory = quendel::test::Fails() ? nullptr : malloc(size == 0 ? 1 : size);
-  if (memory == nullptr) {
+  using New = void* (*)(size_t);
+  static const New next =
+      reinterpret_cast<New>(dlsym(RTLD_NEXT, sizeof size == 8 ? "_Znwm" : "_Znwj"));
+  if (quendel::test::Fails()) {
     throw std::bad_alloc();
   }
-  return memory;
-}
-
-void operator delete(void* memory) noexcept {
-  free(memory);
-}
-
-void operator delete(void* memory, size_t /*size*/) noexcept {
-  free(memory);
+  return next(size);
 }

@@ -1,5 +1,4 @@
-// Allocations that fail on demand. A test program that wants them has scarce_memory.cpp among its
-// sources, which replaces operator new.
+// Allocations that fail on demand.
 #ifndef SUPPORT_SCARCE_MEMORY_H_
 #define SUPPORT_SCARCE_MEMORY_H_
 

@@ -1,81 +1,213 @@
-// How a function is made to pass through the fault plan: one QUENDEL_WRAP line in a faults_*.cpp
-// file, from which the build also takes the linker option.
+// How the calls of a function are made to pass through the kit: one line in a wrapped_*.cpp file,
+// from which the build also takes the linker option.
+//
+//   QUENDEL_WRAP(name, result type, (parameters), arguments...);
+//   QUENDEL_WRAP_CPP(linker's name, "its name in tests", result type, (parameters), arguments...);
+//   QUENDEL_WRAP_BY_HAND(name, "its name in tests"); and __wrap_name() written out, which does its
+//       work by PassCall(). For functions with a variable number of arguments.
 #ifndef SUPPORT_WRAP_H_
 #define SUPPORT_WRAP_H_
 
+#include <json/value.h>
+
+#include <algorithm>
+#include <any>
+#include <atomic>
+#include <cerrno>
+#include <functional>
+#include <memory>
 #include <string>
 #include <type_traits>
+#include <vector>
+
+#include "base/json_text.h"
+#include "support/own_work.h"
 
 namespace quendel::test {
 
-// One call of a wrapped function, counted at its start; what runs before its end is inside it.
-class WrappedCall {
- public:
-  template <typename... Arguments>
-  explicit WrappedCall(const char* function, const Arguments&... arguments) {
-    if (Begin(function)) {
-      std::string text;
-      (Describe(text, arguments), ...);
-      Keep(text);
+struct CallRule;
+
+// A wrapped function. These exist before anything runs, as some functions are called very early,
+// and counting needs no memory.
+struct Wrapped {
+  constexpr explicit Wrapped(const char* nameInTests) : name(nameInTests) {}
+  bool IsPlatformOperation() const;
+
+  const char* name;
+  std::atomic<int> calls[2] = {};                           // the library's, the platform's
+  std::atomic<bool> watched = false;                        // there is something below
+  bool recorded = false;                                    // the library's calls are
+  std::vector<std::shared_ptr<CallRule>>* rules = nullptr;  // never unmade
+  Wrapped* next = nullptr;                                  // in the list of all
+};
+
+// Makes the function known by its name. Returns true.
+bool RegisterWrapped(Wrapped& function);
+
+// ---- Arguments that say more than their type, made in the line of a wrapped function.
+
+// An argument that is shown in another way than its type would have it.
+struct Shown {};
+
+// A descriptor, shown as the path of its open file.
+struct Fd : Shown {
+  explicit Fd(int fd) : number(fd) {}
+  operator int() const { return number; }
+  std::string Text() const;
+
+  int number;
+};
+
+// A number of bytes that can be lessened.
+struct Count : Shown {
+  explicit Count(size_t& number) : bytes(number) {}
+  operator size_t() const { return bytes; }
+  std::string Text() const { return std::to_string(bytes); }
+
+  size_t& bytes;
+};
+
+using Texts = std::vector<std::string>;
+
+// Addresses of other things than texts say nothing, and a buffer may not have been filled yet.
+template <typename Argument>
+void Show(Texts& texts, Argument& argument) {
+  using Plain = std::remove_const_t<Argument>;
+  if constexpr (std::is_base_of_v<Shown, Plain>) {
+    texts.push_back(argument.Text());
+  } else if constexpr (std::is_same_v<Argument, const Json::Value>) {
+    texts.push_back(JsonToText(argument));
+  } else if constexpr (std::is_integral_v<Plain> || std::is_enum_v<Plain>) {
+    texts.push_back(std::to_string(static_cast<long>(argument)));
+  } else if constexpr (std::is_same_v<Plain, const char*>) {
+    texts.emplace_back(argument == nullptr ? "(null)" : argument);
+  } else if constexpr (std::is_convertible_v<Plain, const char* const*>) {
+    for (const char* const* each = argument; *each != nullptr; ++each) {
+      texts.emplace_back(*each);
     }
   }
+}
+
+template <typename Argument>
+void ShortenTo(size_t most, Argument& argument) {
+  if constexpr (std::is_same_v<std::remove_const_t<Argument>, Count>) {
+    argument.bytes = std::min(argument.bytes, most);
+  }
+}
+
+// ---- One call.
+
+// Counted at its start; what runs before its end is inside it.
+class WrappedCall {
+ public:
+  explicit WrappedCall(Wrapped& function);
   ~WrappedCall();
   WrappedCall(const WrappedCall&) = delete;
   WrappedCall& operator=(const WrappedCall&) = delete;
 
-  bool fails() const { return fails_; }
+  // Whether there is more to do than to make the call.
+  bool watched() const { return watched_; }
 
-  template <typename Result>
-  Result result() const {
-    if constexpr (std::is_pointer_v<Result>) {
-      return reinterpret_cast<Result>(result_);
-    } else {
-      return static_cast<Result>(result_);
-    }
-  }
+  // Keeps the arguments, and looks for the rule about this call.
+  void Judge(const Texts& arguments);
+
+  // What comes of the call. Before() first.
+  void Before() const;
+  bool returns() const;
+  long result() const;  // sets errno, too
+  size_t most() const;
+  const std::any& replacement() const;
+  [[noreturn]] void RefuseReplacement() const;
 
  private:
-  // Returns true when the arguments are to be kept.
-  bool Begin(const char* function);
-  static void Keep(const std::string& text);
-
-  // Addresses of other things than texts say nothing, and a buffer may not have been filled yet.
-  template <typename Argument>
-  static void Describe(std::string& text, const Argument& argument) {
-    if constexpr (std::is_integral_v<Argument> || std::is_enum_v<Argument>) {
-      Append(text, std::to_string(static_cast<long>(argument)));
-    } else if constexpr (std::is_same_v<Argument, const char*>) {
-      Append(text, argument == nullptr ? "(null)" : argument);
-    } else if constexpr (std::is_convertible_v<Argument, const char* const*>) {
-      for (const char* const* each = argument; *each != nullptr; ++each) {
-        Append(text, *each);
-      }
-    }
-  }
-  static void Append(std::string& text, const std::string& piece);
-
-  bool platform_ = false;
-  bool fails_ = false;
-  long result_ = 0;
+  Wrapped& function_;
+  bool unseen_;
+  bool in_platform_ = false;
+  bool watched_ = false;
+  std::shared_ptr<CallRule> rule_;
 };
 
-// Makes the function known by its name. Returns true.
-bool RegisterWrapped(const char* function);
+// While one lives, the calling thread acts for a rule: calls of this function are not seen.
+class Acting {
+ public:
+  explicit Acting(const Wrapped& function) : function_(function), outer_(innermost) {
+    innermost = this;
+  }
+  ~Acting() { innermost = outer_; }
+  Acting(const Acting&) = delete;
+  Acting& operator=(const Acting&) = delete;
+
+  static bool For(const Wrapped& function);
+
+ private:
+  static inline thread_local const Acting* innermost = nullptr;
+
+  const Wrapped& function_;
+  const Acting* outer_;
+};
+
+template <typename Result>
+Result ResultFrom(long number) {
+  if constexpr (std::is_pointer_v<Result>) {
+    return reinterpret_cast<Result>(number);
+  } else {
+    return static_cast<Result>(number);
+  }
+}
+
+// Makes the call, or has happen what a rule says. The signature is what a test replaces the
+// function by.
+template <typename Signature, typename Real, typename... Arguments>
+auto PassCall(Wrapped& function, Real real, Arguments&&... arguments) {
+  using Result = typename std::function<Signature>::result_type;
+  WrappedCall call(function);
+  if (!call.watched()) {
+    return real(arguments...);
+  }
+  {
+    const OwnWork ownWork;
+    const int savedErrno = errno;
+    Texts texts;
+    (Show(texts, arguments), ...);
+    call.Judge(texts);
+    errno = savedErrno;
+  }
+  call.Before();
+  if (call.returns()) {
+    return ResultFrom<Result>(call.result());
+  }
+  if (call.replacement().has_value()) {
+    const auto* replacement = std::any_cast<std::function<Signature>>(&call.replacement());
+    if (replacement == nullptr) {
+      call.RefuseReplacement();
+    }
+    const Acting acting(function);
+    return (*replacement)(arguments...);
+  }
+  (ShortenTo(call.most(), arguments), ...);
+  return real(arguments...);
+}
 
 }  // namespace quendel::test
 
-// QUENDEL_WRAP(result type, name, (parameters), arguments...)
-#define QUENDEL_WRAP(Result, function, parameters, ...)                             \
-  extern "C" Result __real_##function parameters;                                   \
-  static_assert(sizeof(static_cast<decltype(&__real_##function)>(&function)) != 0); \
-  extern "C" Result __wrap_##function parameters {                                  \
-    const quendel::test::WrappedCall call(#function, ##__VA_ARGS__);                \
-    return call.fails() ? call.result<Result>() : __real_##function(__VA_ARGS__);   \
-  }                                                                                 \
-  QUENDEL_WRAP_BY_HAND(function)
+#define QUENDEL_WRAP_BY_HAND(symbol, nameInTests)              \
+  static quendel::test::Wrapped wrapped_##symbol(nameInTests); \
+  [[maybe_unused]] static const bool registers_##symbol =      \
+      quendel::test::RegisterWrapped(wrapped_##symbol)
 
-// QUENDEL_WRAP_BY_HAND(name): the same for a function whose __wrap_ is written out.
-#define QUENDEL_WRAP_BY_HAND(function) \
-  [[maybe_unused]] static const bool wraps_##function = quendel::test::RegisterWrapped(#function)
+#define QUENDEL_WRAP_CPP(symbol, nameInTests, Result, parameters, ...)                   \
+  QUENDEL_WRAP_BY_HAND(symbol, nameInTests);                                             \
+  extern "C" Result __real_##symbol parameters;                                          \
+  extern "C" Result __wrap_##symbol parameters;                                          \
+  Result __wrap_##symbol parameters {                                                    \
+    return quendel::test::PassCall<Result parameters>(wrapped_##symbol, __real_##symbol, \
+                                                      ##__VA_ARGS__);                    \
+  }                                                                                      \
+  static_assert(true)
+
+// The compiler compares the types with the function's own.
+#define QUENDEL_WRAP(name, Result, parameters, ...)                 \
+  QUENDEL_WRAP_CPP(name, #name, Result, parameters, ##__VA_ARGS__); \
+  static_assert(sizeof(static_cast<decltype(&__real_##name)>(&name)) != 0)
 
 #endif  // SUPPORT_WRAP_H_

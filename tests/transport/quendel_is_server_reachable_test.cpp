@@ -9,7 +9,7 @@
 #include "quendel.h"
 #include "support/accept_pattern.h"
 #include "support/appliance.h"
-#include "support/faults.h"
+#include "support/calls.h"
 #include "support/log.h"
 
 using namespace quendel::test;
@@ -102,7 +102,7 @@ TEST(IsServerReachableTest, LeavesTheSocketsOfFailedAttemptsOpen) {
 }
 
 TEST(IsServerReachableTest, CountsASocketThatCannotBeHadAsAFailedAttempt) {
-  FailCall("socket", 0, -1, EMFILE);
+  On("socket").Return(-1, EMFILE);
   EXPECT_EQ(QUENDELIsServerReachable(), 0);
   EXPECT_THAT(Log(), AllOf(SizeIs(6), Each(Logged(kUnit,
                                                   "connect to a socket failed, errno: "
@@ -138,7 +138,7 @@ TEST(IsServerReachableTest, GivesUpAtOnceOnAHostWithoutAnAddressOfItsKind) {
   withoutAny.h_addr_list = none;
   for (hostent* host : {&ofAnotherKind, &withoutAny}) {
     ClearLog();
-    FailCall("gethostbyname", 1, reinterpret_cast<long>(host));
+    On("gethostbyname").Nth(1).Return(host);
     EXPECT_EQ(QUENDELIsServerReachable(), 0);
     EXPECT_THAT(Log(), ElementsAre(Logged(
                            kUnit, "Failed to get IP address of target hostname: support.test")));

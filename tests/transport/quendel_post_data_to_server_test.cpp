@@ -4,7 +4,7 @@
 
 #include "quendel.h"
 #include "support/appliance.h"
-#include "support/faults.h"
+#include "support/calls.h"
 #include "support/json.h"
 #include "support/log.h"
 #include "support/server.h"
@@ -185,7 +185,7 @@ TEST(PostDataToServerTest, NeverTakesThePortFromTheUrl) {
 }
 
 TEST(PostDataToServerTest, FailsWithoutATransferHandle) {
-  FailCall("curl_easy_init", 1, 0);
+  On("curl_easy_init").Nth(1).Return(nullptr);
   ExpectFailure();
   EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to allocate memory for curl")));
 }
@@ -193,7 +193,7 @@ TEST(PostDataToServerTest, FailsWithoutATransferHandle) {
 TEST(PostDataToServerTest, FailsWhenAnyHeaderCannotBeAdded) {
   for (int nth = 1; nth <= 3; ++nth) {
     ClearLog();
-    FailCall("curl_slist_append", nth, 0);
+    On("curl_slist_append").Nth(nth).Return(nullptr);
     ExpectFailure();
     EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to allocate memory for curl"))) << nth;
   }
@@ -217,7 +217,7 @@ TEST(PostDataToServerTest, StopsAtTheFirstOptionThatFails) {
   for (int nth = 1; nth <= 9; ++nth) {
     ClearLog();
     ResetCalls();
-    FailCall("curl_easy_setopt", nth, CURLE_UNKNOWN_OPTION);
+    On("curl_easy_setopt").Nth(nth).Return(CURLE_UNKNOWN_OPTION);
     ExpectFailure();
     EXPECT_EQ(Calls("curl_easy_setopt"), nth);
     EXPECT_EQ(Calls("curl_easy_perform"), 0);
@@ -226,7 +226,7 @@ TEST(PostDataToServerTest, StopsAtTheFirstOptionThatFails) {
 }
 
 TEST(PostDataToServerTest, FailsWhenTheStatusCannotBeRead) {
-  FailCall("curl_easy_getinfo", 1, CURLE_UNKNOWN_OPTION);
+  On("curl_easy_getinfo").Nth(1).Return(CURLE_UNKNOWN_OPTION);
   ExpectFailure();
   EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, CurlLine(CURLE_UNKNOWN_OPTION))));
 }

@@ -14,7 +14,7 @@
 
 #include "quendel.h"
 #include "support/appliance.h"
-#include "support/faults.h"
+#include "support/calls.h"
 #include "support/json.h"
 #include "support/log.h"
 #include "support/server.h"
@@ -88,7 +88,7 @@ auto OpenDescriptors() {
 void ExpectConsequences(const Fault& fault, int (*operation)(), const Texts& places) {
   const auto descriptors = OpenDescriptors();
   ResetCalls();
-  FailCall(fault.function, fault.nth, fault.failure);
+  On(fault.function).Nth(fault.nth).Return(fault.failure);
   EXPECT_EQ(operation(), fault.result);
   EXPECT_THAT(LoggedLines(), ElementsAreArray(fault.lines));
   EXPECT_THAT(FilesAt(places), ElementsAreArray(fault.left));
@@ -394,7 +394,7 @@ TEST_P(RemoteCloseFaultTest, HasItsConsequencesAndNoOthers) {
 TEST_P(RemoteCloseFaultTest, IsMendedByRepeatingTheCall) {
   PrepareClose();
   ResetCalls();
-  FailCall(GetParam().function, GetParam().nth, GetParam().failure);
+  On(GetParam().function).Nth(GetParam().nth).Return(GetParam().failure);
   if (CloseSession() != 0) {
     ResetCalls();
     EXPECT_EQ(CloseSession(), 0);

@@ -1,80 +1,15 @@
 // Memory runs out at each allocation in turn. Whichever it is, nothing is thrown at the caller, and
 // a failure is one of the documented ones, with its line in the log.
-//
-// The test kit allocates, in places where the library's calls pass through it; this test does
-// without.
 #include <gmock/gmock.h>
 #include <sys/stat.h>
 
-#include <cstdarg>
-#include <cstdio>
-#include <cstdlib>
-#include <cstring>
 #include <filesystem>
-#include <new>
 
 #include "base/json_text.h"
 #include "quendel.h"
 #include "support/appliance.h"
-
-namespace {
-
-// How many allocations are still to succeed before one fails; negative when none is to.
-int allocationsLeft = -1;
-
-// What was logged, without allocating: lines, each behind a line end.
-char logged[1 << 16];
-
-void Append(const char* format, va_list arguments) {
-  const size_t length = strlen(logged);
-  logged[length] = '\n';
-  vsnprintf(logged + length + 1, sizeof logged - length - 1, format, arguments);
-}
-
-class FailingAllocation {
- public:
-  explicit FailingAllocation(int nth) { allocationsLeft = nth; }
-  ~FailingAllocation() { allocationsLeft = -1; }
-  FailingAllocation(const FailingAllocation&) = delete;
-  FailingAllocation& operator=(const FailingAllocation&) = delete;
-};
-
-}  // namespace
-
-// Not inlined: where the compiler sees into only one side of a pair, it takes malloc() and delete,
-// or new and free(), for a mismatch.
-__attribute__((noinline)) void* operator new(size_t size) {
-  if (allocationsLeft >= 0 && allocationsLeft-- == 0) {
-    throw std::bad_alloc();
-  }
-  void* memory = malloc(size == 0 ? 1 : size);
-  if (memory == nullptr) {
-    throw std::bad_alloc();
-  }
-  return memory;
-}
-
-__attribute__((noinline)) void operator delete(void* memory) noexcept {
-  free(memory);
-}
-
-__attribute__((noinline)) void operator delete(void* memory, size_t /*size*/) noexcept {
-  free(memory);
-}
-
-extern "C" void __wrap_syslog(int /*priority*/, const char* format, ...) {
-  va_list arguments;
-  va_start(arguments, format);
-  Append(format, arguments);
-  va_end(arguments);
-}
-
-extern "C" void __wrap___syslog_chk(int /*priority*/, int /*flag*/, const char* format, ...) {
-  va_list arguments;
-  va_start(arguments, format);
-  Append(format, arguments);
-  va_end(arguments);
-}
+#include "support/log.h"
+#include "support/scarce_memory.h"
 
 namespace {
 
@@ -99,6 +34,14 @@ struct Outcome {
   std::string log;
 };
 
+std::string LogText() {
+  std::string lines;
+  for (const LogLine& line : Log()) {
+    lines += "\n" + line.unit + ":" + std::to_string(line.line) + " " + line.message;
+  }
+  return lines;
+}
+
 // Returns what came of the operation with each of its allocations failed.
 std::vector<Outcome> FailEachAllocation(
     void (*prepare)(), int (*operation)(), void (*inspect)() = [] {}) {
@@ -107,25 +50,20 @@ std::vector<Outcome> FailEachAllocation(
   prepare();
   EXPECT_EQ(operation(), 0);
   const auto descriptors = OpenDescriptors();
-  for (int nth = 0;; ++nth) {
+  for (long nth = 1;; ++nth) {
     prepare();
-    logged[0] = '\0';
-    int result = 0;
-    bool hasFailed = false;
-    {
-      const FailingAllocation failing(nth);
-      result = operation();
-      hasFailed = allocationsLeft < 0;
-    }
-    if (!hasFailed) {
+    ClearLog();
+    FailAllocation(nth);
+    const int result = operation();
+    if (!AllocateFreely()) {
       EXPECT_EQ(result, 0);
       return outcomes;
     }
     EXPECT_TRUE(result == 0 || result == -1) << nth << " gave " << result;
-    EXPECT_TRUE(result == 0 || logged[0] != '\0') << nth;
+    EXPECT_TRUE(result == 0 || !Log().empty()) << nth;
     EXPECT_EQ(OpenDescriptors(), descriptors) << nth;
     inspect();
-    outcomes.push_back({result, logged});
+    outcomes.push_back({result, LogText()});
   }
 }
 

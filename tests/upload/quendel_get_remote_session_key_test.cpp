@@ -7,7 +7,7 @@
 
 #include "quendel.h"
 #include "support/appliance.h"
-#include "support/faults.h"
+#include "support/calls.h"
 #include "support/log.h"
 
 using namespace quendel::test;
@@ -68,7 +68,7 @@ TEST(GetRemoteSessionKeyTest, DoesNotLookAtTheExitStatus) {
 }
 
 TEST(GetRemoteSessionKeyTest, FailsWithoutTheTool) {
-  FailCall("ALIBCPopen", 1, 0, EACCES);
+  On("ALIBCPopen").Nth(1).Return(nullptr, EACCES);
   char key[8] = {};
   EXPECT_EQ(QUENDELGetRemoteSessionKey(key, sizeof key - 1), -1);
   EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "ALIBCPopen failed(Permission denied)\n")));

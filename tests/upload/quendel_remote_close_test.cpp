@@ -9,7 +9,7 @@
 #include "base/json_text.h"
 #include "quendel.h"
 #include "support/appliance.h"
-#include "support/faults.h"
+#include "support/calls.h"
 #include "support/json.h"
 #include "support/log.h"
 #include "support/server.h"
@@ -23,17 +23,7 @@ using testing::SizeIs;
 namespace {
 
 constexpr char kUnit[] = "quendel_remote_close";
-// The calls of the web API, and what it answers. With no answer queued it reports success.
-std::vector<std::string>& ApiCalls() {
-  static std::vector<std::string> calls;
-  return calls;
-}
-
-std::deque<Json::Value>& ApiAnswers() {
-  static std::deque<Json::Value> answers;
-  return answers;
-}
-
+constexpr char kApi[] = "ARVO::APIRunner::Exec";
 constexpr char kConf[] = "/usr/arvo/etc/quendel.remote.conf";
 
 std::vector<std::string> RequestLines() {
@@ -44,21 +34,20 @@ std::vector<std::string> RequestLines() {
   return lines;
 }
 
+class RemoteCloseTest : public testing::Test {
+ protected:
+  RemoteCloseTest() { AnswerTheApi(R"({"success":true})"); }
+
+  // What the web API answers from now on.
+  static void AnswerTheApi(const std::string& reply) {
+    On(kApi).Replace([reply](Json::Value& out, const char*, int, const char*, const Json::Value&,
+                             const char*) { out = JsonOf(reply); });
+  }
+};
+
 }  // namespace
 
-extern "C" void __wrap__ZN4ARVO9APIRunner4ExecERN4Json5ValueEPKciS5_RKS2_S5_(
-    Json::Value& out, const char* api, int version, const char* method, const Json::Value& params,
-    const char* user) {
-  ApiCalls().push_back(std::string(api) + "|" + std::to_string(version) + "|" + method + "|" +
-                       quendel::JsonToText(params) + "|" + user);
-  out = JsonOf(R"({"success":true})");
-  if (!ApiAnswers().empty()) {
-    out = ApiAnswers().front();
-    ApiAnswers().pop_front();
-  }
-}
-
-TEST(RemoteCloseTest, ReportsTheEndAndRemovesTheFile) {
+TEST_F(RemoteCloseTest, ReportsTheEndAndRemovesTheFile) {
   SetIdentity();
   WriteFile(kConf, "stop_sshd_after_complete=\"no\"\n");
   Record("ALIBCExec");
@@ -70,7 +59,7 @@ TEST(RemoteCloseTest, ReportsTheEndAndRemovesTheFile) {
   EXPECT_THAT(Log(), IsEmpty());
 }
 
-TEST(RemoteCloseTest, ReportsAFailedSessionAsFailed) {
+TEST_F(RemoteCloseTest, ReportsAFailedSessionAsFailed) {
   SetIdentity();
   WriteFile(kConf, "remote_account=\n");
   EXPECT_EQ(QUENDELRemoteClose(17, QUENDEL_ACT_PROGRESS_FAILED), 0);
@@ -79,7 +68,7 @@ TEST(RemoteCloseTest, ReportsAFailedSessionAsFailed) {
   EXPECT_FALSE(Exists(kConf));
 }
 
-TEST(RemoteCloseTest, RefusesEveryOtherProgress) {
+TEST_F(RemoteCloseTest, RefusesEveryOtherProgress) {
   SetIdentity();
   WriteFile(kConf, "remote_account=\"support\"\n");
   for (const int progress : {1, -2, -3, 2, INT_MAX, INT_MIN}) {
@@ -93,18 +82,18 @@ TEST(RemoteCloseTest, RefusesEveryOtherProgress) {
   EXPECT_EQ(Calls("ARVOLocalAccountUserDelete"), 0);
 }
 
-TEST(RemoteCloseTest, DeletesTheAccountBeforeItReports) {
+TEST_F(RemoteCloseTest, DeletesTheAccountBeforeItReports) {
   SetIdentity();
   ASSERT_EQ(QUENDELSupportAccountUserCreate("support", "key"), 0);
   WriteFile(kConf, "remote_account=\"support\"\n");
   Record("ARVOLocalAccountUserDelete");
-  FailCall("ARVOMYHUBAccountGet", 1, -1);  // so that the report fails
+  On("ARVOMYHUBAccountGet").Nth(1).Return(-1);  // so that the report fails
   EXPECT_EQ(QUENDELRemoteClose(17, QUENDEL_ACT_PROGRESS_DONE), -1);
   EXPECT_FALSE(Exists("/run/quendelhome"));
   EXPECT_THAT(Recorded(), ElementsAre("support|1"));
 }
 
-TEST(RemoteCloseTest, ClosesASessionWhole) {
+TEST_F(RemoteCloseTest, ClosesASessionWhole) {
   SetIdentity();
   ASSERT_EQ(QUENDELSupportAccountUserCreate("support", "key"), 0);
   WriteFile(kConf, "stop_sshd_after_complete=\"yes\"\nremote_account=\"support\"\n");
@@ -115,7 +104,7 @@ TEST(RemoteCloseTest, ClosesASessionWhole) {
   EXPECT_THAT(Log(), IsEmpty());
 }
 
-TEST(RemoteCloseTest, TakesAFileWithoutSettings) {
+TEST_F(RemoteCloseTest, TakesAFileWithoutSettings) {
   SetIdentity();
   for (const char* text : {"", "# none\n"}) {
     WriteFile(kConf, text);
@@ -126,7 +115,7 @@ TEST(RemoteCloseTest, TakesAFileWithoutSettings) {
   EXPECT_THAT(Log(), IsEmpty());
 }
 
-TEST(RemoteCloseTest, ReadsTheFileIntoAHashFor1024Pairs) {
+TEST_F(RemoteCloseTest, ReadsTheFileIntoAHashFor1024Pairs) {
   SetIdentity();
   WriteFile(kConf, "other=1\n");
   Record("ALIBCSzHashAlloc");
@@ -134,27 +123,27 @@ TEST(RemoteCloseTest, ReadsTheFileIntoAHashFor1024Pairs) {
   EXPECT_THAT(Recorded(), ElementsAre("1024"));
 }
 
-TEST(RemoteCloseTest, FailsWithoutMemoryForTheSettings) {
+TEST_F(RemoteCloseTest, FailsWithoutMemoryForTheSettings) {
   WriteFile(kConf, "remote_account=\"support\"\n");
-  FailCall("ALIBCSzHashAlloc", 1, 0);
+  On("ALIBCSzHashAlloc").Nth(1).Return(nullptr);
   EXPECT_EQ(QUENDELRemoteClose(17, QUENDEL_ACT_PROGRESS_DONE), -1);
   EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Fail to allocate memory for alibc hash")));
   EXPECT_TRUE(Exists(kConf));
 }
 
-TEST(RemoteCloseTest, FailsWithoutASession) {
+TEST_F(RemoteCloseTest, FailsWithoutASession) {
   SetIdentity();
   EXPECT_EQ(QUENDELRemoteClose(17, QUENDEL_ACT_PROGRESS_DONE), -1);
   EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to get quendel key configuration file")));
   EXPECT_THAT(Requests(), IsEmpty());
 }
 
-TEST(RemoteCloseTest, FailsWhenTheFileCannotBeRead) {
+TEST_F(RemoteCloseTest, FailsWhenTheFileCannotBeRead) {
   SetIdentity();
   WriteFile(kConf, "other=1\n");
   for (const long result : {-1L, -2L}) {
     ClearLog();
-    FailCall("ALIBCFileGetPair", 1, result);
+    On("ALIBCFileGetPair").Nth(1).Return(result);
     EXPECT_EQ(QUENDELRemoteClose(17, QUENDEL_ACT_PROGRESS_DONE), -1) << result;
     EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to get quendel key configuration file")));
   }
@@ -162,10 +151,10 @@ TEST(RemoteCloseTest, FailsWhenTheFileCannotBeRead) {
   EXPECT_TRUE(Exists(kConf));
 }
 
-TEST(RemoteCloseTest, FailsWhenTheAccountCannotBeDeleted) {
+TEST_F(RemoteCloseTest, FailsWhenTheAccountCannotBeDeleted) {
   SetIdentity();
   WriteFile(kConf, "stop_sshd_after_complete=\"yes\"\nremote_account=\"support\"\n");
-  FailCall("ALIBCMResultCoreErrorsGet", 1, 0);
+  On("ALIBCMResultCoreErrorsGet").Nth(1).Return(nullptr);
   EXPECT_EQ(QUENDELRemoteClose(17, QUENDEL_ACT_PROGRESS_DONE), -1);
   EXPECT_THAT(Log(),
               ElementsAre(Logged("quendel_support_account_user", "ALIBCMResultCoreErrorsGet fail"),
@@ -174,7 +163,7 @@ TEST(RemoteCloseTest, FailsWhenTheAccountCannotBeDeleted) {
   EXPECT_TRUE(Exists(kConf));
 }
 
-TEST(RemoteCloseTest, FailsWhenTheServerCannotBeTold) {
+TEST_F(RemoteCloseTest, FailsWhenTheServerCannotBeTold) {
   SetIdentity();
   WriteFile(kConf, "stop_sshd_after_complete=\"yes\"\n");
   Answer({.body = R"({"success":false})"});
@@ -182,65 +171,66 @@ TEST(RemoteCloseTest, FailsWhenTheServerCannotBeTold) {
   EXPECT_THAT(Log(), ElementsAre(Logged("quendel_update_act_request_progress", _),
                                  Logged(kUnit, "Failed to update progress to server")));
   EXPECT_TRUE(Exists(kConf));
-  EXPECT_THAT(ApiCalls(), IsEmpty());  // the ssh service is left as it is
+  EXPECT_EQ(Calls(kApi), 0);  // the ssh service is left as it is
 }
 
-TEST(RemoteCloseTest, StopsSshdAsTheAdministrator) {
+TEST_F(RemoteCloseTest, StopsSshdAsTheAdministrator) {
   SetIdentity();
   WriteFile(kConf, "stop_sshd_after_complete=\"yes\"\n");
+  Record(kApi);
   EXPECT_EQ(QUENDELRemoteClose(17, QUENDEL_ACT_PROGRESS_DONE), 0);
-  EXPECT_THAT(ApiCalls(), ElementsAre(R"(ARVO.Core.Terminal|3|set|{"enable_ssh":false}|admin)"));
+  EXPECT_THAT(Recorded(), ElementsAre(R"(ARVO.Core.Terminal|3|set|{"enable_ssh":false}|admin)"));
 }
 
-TEST(RemoteCloseTest, StopsSshdOnlyForExactlyYes) {
+TEST_F(RemoteCloseTest, StopsSshdOnlyForExactlyYes) {
   SetIdentity();
   for (const char* value : {"Yes", "YES", "true", "1", "yes!", "no", ""}) {
     WriteFile(kConf, std::string("stop_sshd_after_complete=\"") + value + "\"\n");
     EXPECT_EQ(QUENDELRemoteClose(17, QUENDEL_ACT_PROGRESS_DONE), 0);
-    EXPECT_THAT(ApiCalls(), IsEmpty()) << value;
+    EXPECT_EQ(Calls(kApi), 0) << value;
   }
   WriteFile(kConf, "other=1\n");
   EXPECT_EQ(QUENDELRemoteClose(17, QUENDEL_ACT_PROGRESS_DONE), 0);
-  EXPECT_THAT(ApiCalls(), IsEmpty());
+  EXPECT_EQ(Calls(kApi), 0);
 }
 
-TEST(RemoteCloseTest, SshdThatDoesNotStopFailsNothing) {
+TEST_F(RemoteCloseTest, SshdThatDoesNotStopFailsNothing) {
   SetIdentity();
   for (const char* reply : {R"({"success":false})", "{}", "[]", "null", R"({"success":"true"})"}) {
     ClearLog();
     WriteFile(kConf, "stop_sshd_after_complete=\"yes\"\n");
-    ApiAnswers().push_back(JsonOf(reply));
+    AnswerTheApi(reply);
     EXPECT_EQ(QUENDELRemoteClose(17, QUENDEL_ACT_PROGRESS_DONE), 0) << reply;
     EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to stop ssh service"))) << reply;
     EXPECT_FALSE(Exists(kConf));
   }
 }
 
-TEST(RemoteCloseTest, FailsWhenTheFileCannotBeRemoved) {
+TEST_F(RemoteCloseTest, FailsWhenTheFileCannotBeRemoved) {
   SetIdentity();
   WriteFile(kConf, "other=1\n");
-  FailCall("ALIBCExec", 1, -1);
+  On("ALIBCExec").Nth(1).Return(-1);
   EXPECT_EQ(QUENDELRemoteClose(17, QUENDEL_ACT_PROGRESS_DONE), -1);
   EXPECT_THAT(Log(),
               ElementsAre(Logged(kUnit, "Failed to rm dir '/usr/arvo/etc/quendel.remote.conf'")));
 }
 
-TEST(RemoteCloseTest, StopsSshdBeforeItRemovesTheFile) {
+TEST_F(RemoteCloseTest, StopsSshdBeforeItRemovesTheFile) {
   SetIdentity();
   WriteFile(kConf, "stop_sshd_after_complete=\"yes\"\n");
   const auto notRemoved = Logged(kUnit, "Failed to rm dir '/usr/arvo/etc/quendel.remote.conf'");
-  FailCall("ALIBCExec", 1, -1);
+  On("ALIBCExec").Nth(1).Return(-1);
   EXPECT_EQ(QUENDELRemoteClose(17, QUENDEL_ACT_PROGRESS_DONE), -1);
-  EXPECT_THAT(ApiCalls(), SizeIs(1));
+  EXPECT_EQ(Calls(kApi), 1);
   EXPECT_THAT(Log(), ElementsAre(notRemoved));
   ClearLog();
-  ApiAnswers().push_back(JsonOf(R"({"success":false})"));
-  FailCall("ALIBCExec", 1, -1);
+  AnswerTheApi(R"({"success":false})");
+  On("ALIBCExec").Nth(1).Return(-1);
   EXPECT_EQ(QUENDELRemoteClose(17, QUENDEL_ACT_PROGRESS_DONE), -1);
   EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to stop ssh service"), notRemoved));
 }
 
-TEST(RemoteCloseTest, CanBeRepeatedAfterAFailure) {
+TEST_F(RemoteCloseTest, CanBeRepeatedAfterAFailure) {
   SetIdentity();
   ASSERT_EQ(QUENDELSupportAccountUserCreate("support", "key"), 0);
   WriteFile(kConf, "remote_account=\"support\"\n");

@@ -6,7 +6,7 @@
 
 #include "quendel.h"
 #include "support/appliance.h"
-#include "support/faults.h"
+#include "support/calls.h"
 #include "support/json.h"
 #include "support/log.h"
 #include "support/replies.h"
@@ -125,7 +125,7 @@ TEST(SendUploadDataTest, LeavesTheFilesAlone) {
 }
 
 TEST(SendUploadDataTest, FailsWithoutMemoryBeforeAnythingElse) {
-  FailCall("calloc", 1, 0);
+  On("calloc").Nth(1).Return(nullptr);
   EXPECT_EQ(QUENDELSendUploadData(17, {}), -1);
   EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to malloc for pMyhubAccount")));
   EXPECT_EQ(Calls("ARVOMYHUBAccountGet"), 0);
@@ -149,9 +149,9 @@ TEST(SendUploadDataTest, FailsWithoutASerialNumber) {
 
 TEST(SendUploadDataTest, FailsOnAnyNegativeResult) {
   SetIdentity();
-  FailCall("ARVOMYHUBAccountGet", 1, -2);
+  On("ARVOMYHUBAccountGet").Nth(1).Return(-2);
   EXPECT_EQ(QUENDELSendUploadData(17, {}), -1);
-  FailCall("ALIBGetSerialNumber", 1, -2);
+  On("ALIBGetSerialNumber").Nth(1).Return(-2);
   EXPECT_EQ(QUENDELSendUploadData(17, {}), -1);
   EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to get account"),
                                  Logged(kUnit, "Failed to get serial number")));
@@ -171,7 +171,7 @@ TEST(SendUploadDataTest, FailsWhenTheServerRefuses) {
 
 TEST(SendUploadDataTest, FailsWhenThePostDoesNotGetThrough) {
   SetIdentity();
-  FailCall("curl_easy_perform", 1, 7);
+  On("curl_easy_perform").Nth(1).Return(7);
   EXPECT_EQ(QUENDELSendUploadData(17, {}), -1);
   EXPECT_THAT(Log(), ElementsAre(Logged("quendel_post_file_to_server", _),
                                  Logged(kUnit, "Failed to post file to server")));

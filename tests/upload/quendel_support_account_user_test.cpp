@@ -10,7 +10,7 @@
 
 #include "quendel.h"
 #include "support/appliance.h"
-#include "support/faults.h"
+#include "support/calls.h"
 #include "support/log.h"
 
 using namespace quendel::test;
@@ -113,7 +113,7 @@ TEST(SupportAccountUserCreateTest, WritesAnEmptyKey) {
 }
 
 TEST(SupportAccountUserCreateTest, FailsWhenMkdirCannotRun) {
-  FailCall("ALIBCExec", 1, -1, ENOENT);
+  On("ALIBCExec").Nth(1).Return(-1, ENOENT);
   EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), -1);
   EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to mkdir '/run/quendelhome/.ssh'\n")));
   EXPECT_EQ(Calls("ARVOLocalAccountUserPrepareForQuendel"), 0);
@@ -121,28 +121,28 @@ TEST(SupportAccountUserCreateTest, FailsWhenMkdirCannotRun) {
 
 TEST(SupportAccountUserCreateTest, PassesOverADirThatSomeoneElseMadeMeanwhile) {
   MakeSshDir();
-  FailCall("ALIBCFileCheckDir", 1, 0);
-  FailCall("ALIBCExec", 1, -1, EEXIST);
+  On("ALIBCFileCheckDir").Nth(1).Return(0);
+  On("ALIBCExec").Nth(1).Return(-1, EEXIST);
   EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), 0);
   EXPECT_THAT(Log(), IsEmpty());
 }
 
 TEST(SupportAccountUserCreateTest, GoesOnWhenItCannotTellWhetherTheDirIsThere) {
   MakeSshDir();
-  FailCall("ALIBCFileCheckDir", 1, -1);
+  On("ALIBCFileCheckDir").Nth(1).Return(-1);
   EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), 0);
   EXPECT_EQ(Calls("ALIBCExec"), 0);
 }
 
 TEST(SupportAccountUserCreateTest, FailsWhenTheHomeCannotChangeHands) {
-  FailCall("chown", 1, -1, EPERM);
+  On("chown").Nth(1).Return(-1, EPERM);
   EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), -1);
   EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to chown '/run/quendelhome'")));
   EXPECT_FALSE(HasAccount("support"));
 }
 
 TEST(SupportAccountUserCreateTest, FailsWhenMkdirRanButMadeNothing) {
-  FailCall("ALIBCExec", 1, 1);  // its exit status is nobody's concern; the home is missing
+  On("ALIBCExec").Nth(1).Return(1);  // its exit status is nobody's concern; the home is missing
   EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), -1);
   EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to chown '/run/quendelhome'")));
 }
@@ -150,7 +150,7 @@ TEST(SupportAccountUserCreateTest, FailsWhenMkdirRanButMadeNothing) {
 TEST(SupportAccountUserCreateTest, FailsWhenTheAccountCannotBePrepared) {
   for (const long result : {-1L, -2L}) {
     ClearLog();
-    FailCall("ARVOLocalAccountUserPrepareForQuendel", 1, result);
+    On("ARVOLocalAccountUserPrepareForQuendel").Nth(1).Return(result);
     EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), -1) << result;
     EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to prepare local account 'support'")));
     EXPECT_FALSE(Exists(kKeyFile));
@@ -158,7 +158,7 @@ TEST(SupportAccountUserCreateTest, FailsWhenTheAccountCannotBePrepared) {
 }
 
 TEST(SupportAccountUserCreateTest, TakesAnyResultButANegativeOneForPrepared) {
-  FailCall("ARVOLocalAccountUserPrepareForQuendel", 1, 1);
+  On("ARVOLocalAccountUserPrepareForQuendel").Nth(1).Return(1);
   EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), 0);
   EXPECT_EQ(ReadFile(kKeyFile), kKey);
   EXPECT_THAT(Log(), IsEmpty());
@@ -214,7 +214,7 @@ TEST(SupportAccountUserCreateTest, FailsWhenTheKeyCannotBeWritten) {
   MakeSshDir();
   // A file may not grow at all, as on a full disk.
   signal(SIGXFSZ, SIG_IGN);
-  FailCall("ARVOLocalAccountUserPrepareForQuendel", 1, 0);
+  On("ARVOLocalAccountUserPrepareForQuendel").Nth(1).Return(0);
   const rlimit none = {0, RLIM_INFINITY};
   ASSERT_EQ(setrlimit(RLIMIT_FSIZE, &none), 0);
   const int result = QUENDELSupportAccountUserCreate("support", kKey);
@@ -228,7 +228,7 @@ TEST(SupportAccountUserCreateTest, FailsWhenTheKeyCannotBeWritten) {
 
 TEST(SupportAccountUserCreateTest, FailsWhenTheModeCannotBeSet) {
   umask(0);
-  FailCall("fchmod", 1, -1, EROFS);
+  On("fchmod").Nth(1).Return(-1, EROFS);
   EXPECT_EQ(QUENDELSupportAccountUserCreate("support", kKey), -1);
   EXPECT_EQ(Mode(kKeyFile), 0666U);  // as any new file has it
   EXPECT_THAT(
@@ -259,7 +259,7 @@ TEST(SupportAccountUserDeleteTest, RemovesTheHomeOnlyWhenItIsADirectory) {
 
 TEST(SupportAccountUserDeleteTest, LeavesAHomeThatItCannotTellToBeOne) {
   MakeSshDir();
-  FailCall("ALIBCFileCheckDir", 1, -1);
+  On("ALIBCFileCheckDir").Nth(1).Return(-1);
   EXPECT_EQ(QUENDELSupportAccountUserDelete("nobody-there"), 0);
   EXPECT_TRUE(Exists(kSshDir));
 }
@@ -273,7 +273,7 @@ TEST(SupportAccountUserDeleteTest, AccountThatIsGoneCountsAsDeleted) {
 TEST(SupportAccountUserDeleteTest, AsksForTheErrorCodesAfterAnyNegativeResult) {
   for (const long result : {-1L, -2L}) {
     ResetCalls();
-    FailCall("ARVOLocalAccountUserDelete", 1, result);
+    On("ARVOLocalAccountUserDelete").Nth(1).Return(result);
     EXPECT_EQ(QUENDELSupportAccountUserDelete("support"), -1) << result;
     EXPECT_EQ(Calls("ALIBCMResultCoreErrorsGet"), 1);
   }
@@ -282,7 +282,7 @@ TEST(SupportAccountUserDeleteTest, AsksForTheErrorCodesAfterAnyNegativeResult) {
 TEST(SupportAccountUserDeleteTest, TakesAnyOtherResultForDeleted) {
   for (const long result : {0L, 1L}) {
     ResetCalls();
-    FailCall("ARVOLocalAccountUserDelete", 1, result);
+    On("ARVOLocalAccountUserDelete").Nth(1).Return(result);
     EXPECT_EQ(QUENDELSupportAccountUserDelete("support"), 0) << result;
     EXPECT_EQ(Calls("ALIBCMResultCoreErrorsGet"), 0);
   }
@@ -291,7 +291,7 @@ TEST(SupportAccountUserDeleteTest, TakesAnyOtherResultForDeleted) {
 
 TEST(SupportAccountUserDeleteTest, FailsWhenTheHomeCannotBeRemoved) {
   MakeSshDir();
-  FailCall("ALIBCExec", 1, -1);
+  On("ALIBCExec").Nth(1).Return(-1);
   EXPECT_EQ(QUENDELSupportAccountUserDelete("support"), -1);
   EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to remove '/run/quendelhome'")));
   EXPECT_EQ(Calls("ARVOLocalAccountUserDelete"), 0);
@@ -299,21 +299,21 @@ TEST(SupportAccountUserDeleteTest, FailsWhenTheHomeCannotBeRemoved) {
 }
 
 TEST(SupportAccountUserDeleteTest, FailsWhenThereIsNoErrorCode) {
-  FailCall("ALIBCMResultCoreErrorsGet", 1, 0);
+  On("ALIBCMResultCoreErrorsGet").Nth(1).Return(nullptr);
   EXPECT_EQ(QUENDELSupportAccountUserDelete("nobody-there"), -1);
   EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "ALIBCMResultCoreErrorsGet fail")));
 }
 
 TEST(SupportAccountUserDeleteTest, FailsOnAnyOtherErrorCode) {
   static const int other[] = {7425};
-  FailCall("ALIBCMResultCoreErrorsGet", 1, reinterpret_cast<long>(other));
+  On("ALIBCMResultCoreErrorsGet").Nth(1).Return(other);
   EXPECT_EQ(QUENDELSupportAccountUserDelete("nobody-there"), -1);
   EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to delete local account 'nobody-there'\n")));
 }
 
 TEST(SupportAccountUserDeleteTest, GoesByTheFirstErrorCode) {
   static const int first[] = {7424, 7425};
-  FailCall("ALIBCMResultCoreErrorsGet", 1, reinterpret_cast<long>(first));
+  On("ALIBCMResultCoreErrorsGet").Nth(1).Return(first);
   EXPECT_EQ(QUENDELSupportAccountUserDelete("nobody-there"), 0);
 }
 
@@ -321,16 +321,16 @@ TEST(SupportAccountUserDeleteTest, FreesTheResultOnEveryPath) {
   EXPECT_EQ(QUENDELSupportAccountUserDelete("nobody-there"), 0);
   EXPECT_EQ(Calls("ALIBCMResultAlloc"), 1);
   EXPECT_EQ(Calls("ALIBCMResultFree"), 1);
-  FailCall("ARVOLocalAccountUserDelete", 1, 0);
+  On("ARVOLocalAccountUserDelete").Nth(1).Return(0);
   EXPECT_EQ(QUENDELSupportAccountUserDelete("nobody-there"), 0);
   EXPECT_EQ(Calls("ALIBCMResultFree"), 2);
-  FailCall("ALIBCMResultCoreErrorsGet", 1, 0);
+  On("ALIBCMResultCoreErrorsGet").Nth(1).Return(nullptr);
   EXPECT_EQ(QUENDELSupportAccountUserDelete("nobody-there"), -1);
   EXPECT_EQ(Calls("ALIBCMResultFree"), 3);
 }
 
 TEST(SupportAccountUserDeleteTest, BearsAResultThatCouldNotBeMade) {
-  FailCall("ALIBCMResultAlloc", 1, 0);
+  On("ALIBCMResultAlloc").Nth(1).Return(nullptr);
   EXPECT_EQ(QUENDELSupportAccountUserDelete("nobody-there"), -1);
   EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "ALIBCMResultCoreErrorsGet fail")));
 }

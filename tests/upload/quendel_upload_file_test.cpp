@@ -10,7 +10,7 @@
 #include "base/json_text.h"
 #include "quendel.h"
 #include "support/appliance.h"
-#include "support/faults.h"
+#include "support/calls.h"
 #include "support/json.h"
 #include "support/log.h"
 #include "support/server.h"
@@ -390,10 +390,10 @@ TEST_F(UploadFileTest, GivesTheToolsNoOtherPathWhateverIsAskedFor) {
   for (unsigned int seed = 0; seed < 20000; ++seed) {
     SCOPED_TRACE("seed " + std::to_string(seed));
     StartOver();
-    FailCall("ALIBCExec", 0, 1);
-    FailCall("ALIBCExecl", 0, -1);
-    FailCall("ARVOFSMkdirP", 0, 0);
-    FailCall("ARVOMYHUBAccountGet", 0, -1);
+    On("ALIBCExec").Return(1);
+    On("ALIBCExecl").Return(-1);
+    On("ARVOFSMkdirP").Return(0);
+    On("ARVOMYHUBAccountGet").Return(-1);
     const int result = Upload(AnyRequest(seed).Files());
     EXPECT_EQ(result, -1);  // nothing can be told without an account
     for (const std::string& command : Recorded()) {
@@ -486,8 +486,8 @@ TEST_F(UploadFileTest, TakesTheTimeBeforeItPreparesAFile) {
 }
 
 TEST_F(UploadFileTest, TakesTheTimeOfEachFile) {
-  FailCall("time", 1, 1700000001);
-  FailCall("time", 2, 1700000002);
+  On("time").Nth(1).Return(1700000001);
+  On("time").Nth(2).Return(1700000002);
   EXPECT_EQ(Upload(List({File("coredump", kDump), File("coredump", kDump)})), 0);
   ASSERT_THAT(Requests(), SizeIs(1));
   EXPECT_THAT(Requests()[0].body, HasSubstr("\"timestamp\":\"1700000001\""));
@@ -497,7 +497,7 @@ TEST_F(UploadFileTest, TakesTheTimeOfEachFile) {
 TEST_F(UploadFileTest, GivesADumpUpWithoutItsDirectory) {
   for (const long result : {-1L, -2L}) {
     StartOver();
-    FailCall("ARVOFSMkdirP", 1, result);
+    On("ARVOFSMkdirP").Nth(1).Return(result);
     EXPECT_EQ(Upload(List({File("coredump", kDump)})), 0);
     EXPECT_THAT(Log(),
                 ElementsAre(Logged(kUnit, "Fail to ARVOFSMkdirP for '/tmp/quendel/coredump'"),
@@ -510,7 +510,7 @@ TEST_F(UploadFileTest, GivesADumpUpWithoutItsDirectory) {
 TEST_F(UploadFileTest, TakesAnyResultButANegativeOneForADirectory) {
   WriteFile("/tmp/quendel/coredump/file", "");
   WriteFile("/tmp/quendel/debugdat/file", "");
-  FailCall("ARVOFSMkdirP", 0, 1);
+  On("ARVOFSMkdirP").Return(1);
   EXPECT_EQ(Upload(List({File("coredump", kDump), File("debug.dat", "")})), 0);
   EXPECT_THAT(Log(), IsEmpty());
   EXPECT_THAT(RequestLines(), ElementsAre(kUpload));
@@ -519,7 +519,7 @@ TEST_F(UploadFileTest, TakesAnyResultButANegativeOneForADirectory) {
 TEST_F(UploadFileTest, GivesADumpUpThatCannotBeCompressed) {
   for (const long status : {1L, -1L, 137L}) {
     StartOver();
-    FailCall("ALIBCExec", 1, status);
+    On("ALIBCExec").Nth(1).Return(status);
     EXPECT_EQ(Upload(List({File("coredump", kDump)})), 0);
     EXPECT_THAT(
         Log(), ElementsAre(Logged(kUnit, "Fail to compress coredump"), GivenUp("coredump", kDump)));
@@ -531,7 +531,7 @@ TEST_F(UploadFileTest, GivesADumpUpThatCannotBeCompressed) {
 TEST_F(UploadFileTest, TakesTheCopyAwayThatCannotBeMoved) {
   for (const long status : {1L, -1L}) {
     StartOver();
-    FailCall("ALIBCExec", 2, status);
+    On("ALIBCExec").Nth(2).Return(status);
     EXPECT_EQ(Upload(List({File("coredump", kDump)})), 0);
     EXPECT_THAT(Log(),
                 ElementsAre(Logged(kUnit, "Fail to move coredump"), GivenUp("coredump", kDump)));
@@ -543,8 +543,8 @@ TEST_F(UploadFileTest, TakesTheCopyAwayThatCannotBeMoved) {
 }
 
 TEST_F(UploadFileTest, TellsOfACopyThatCannotBeTakenAway) {
-  FailCall("ALIBCExec", 2, 1);
-  FailCall("ALIBCExecl", 1, -1);
+  On("ALIBCExec").Nth(2).Return(1);
+  On("ALIBCExecl").Nth(1).Return(-1);
   EXPECT_EQ(Upload(List({File("coredump", kDump)})), 0);
   EXPECT_THAT(Log(),
               ElementsAre(Logged(kUnit, "Fail to move coredump"),
@@ -555,8 +555,8 @@ TEST_F(UploadFileTest, TellsOfACopyThatCannotBeTakenAway) {
 TEST_F(UploadFileTest, LooksOnlyWhetherTheRemovalOfACopyCouldRun) {
   for (const long result : {1L, -2L}) {
     StartOver();
-    FailCall("ALIBCExec", 2, 1);
-    FailCall("ALIBCExecl", 1, result);
+    On("ALIBCExec").Nth(2).Return(1);
+    On("ALIBCExecl").Nth(1).Return(result);
     EXPECT_EQ(Upload(List({File("coredump", kDump)})), 0);
     EXPECT_THAT(Log(),
                 ElementsAre(Logged(kUnit, "Fail to move coredump"), GivenUp("coredump", kDump)));
@@ -605,7 +605,7 @@ TEST_F(UploadFileTest, CollectsAndSendsTheDebugArchive) {
 }
 
 TEST_F(UploadFileTest, GivesTheDebugArchiveUpWithoutItsDirectory) {
-  FailCall("ARVOFSMkdirP", 1, -1);
+  On("ARVOFSMkdirP").Nth(1).Return(-1);
   EXPECT_EQ(Upload(List({File("debug.dat", "p")})), 0);
   EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Fail to ARVOFSMkdirP for '/tmp/quendel/debugdat'"),
                                  GivenUp("debug.dat", "p")));
@@ -616,7 +616,7 @@ TEST_F(UploadFileTest, GivesTheDebugArchiveUpWithoutItsDirectory) {
 TEST_F(UploadFileTest, GivesTheDebugArchiveUpWhenNothingCouldBeCollected) {
   for (const long status : {1L, -1L}) {
     StartOver();
-    FailCall("ALIBCExec", 1, status);
+    On("ALIBCExec").Nth(1).Return(status);
     EXPECT_EQ(Upload(List({File("debug.dat", "p")})), 0);
     EXPECT_THAT(Log(),
                 ElementsAre(Logged(kUnit,
@@ -630,7 +630,7 @@ TEST_F(UploadFileTest, GivesTheDebugArchiveUpWhenNothingCouldBeCollected) {
 TEST_F(UploadFileTest, GivesTheDebugArchiveUpThatCouldNotBePacked) {
   for (const long result : {-1L, -2L}) {
     StartOver();
-    FailCall("ALIBCExecl", 1, result);
+    On("ALIBCExecl").Nth(1).Return(result);
     EXPECT_EQ(Upload(List({File("debug.dat", "p")})), 0);
     EXPECT_THAT(Log(),
                 ElementsAre(Logged(kUnit, "Fail to zip attachment /tmp/quendel/debugdat.zip"),
@@ -727,7 +727,7 @@ TEST_F(UploadFileTest, FailsWhenTheServerCannotBeToldThatThereIsNoFile) {
 }
 
 TEST_F(UploadFileTest, TellsOfADirectoryThatCannotBeRemoved) {
-  FailCall("ALIBCExecl", 1, -1);
+  On("ALIBCExecl").Nth(1).Return(-1);
   EXPECT_EQ(Upload(List({File("coredump", kDump)})), 0);
   EXPECT_THAT(Log(),
               ElementsAre(Logged(kUnit, "Fail to remove temp logs [/tmp/quendel/coredump]")));
@@ -736,14 +736,14 @@ TEST_F(UploadFileTest, TellsOfADirectoryThatCannotBeRemoved) {
 TEST_F(UploadFileTest, LooksOnlyWhetherTheRemovalCouldRun) {
   for (const long result : {1L, -2L}) {
     StartOver();
-    FailCall("ALIBCExecl", 1, result);
+    On("ALIBCExecl").Nth(1).Return(result);
     EXPECT_EQ(Upload(List({File("coredump", kDump)})), 0);
     EXPECT_THAT(Log(), IsEmpty());
   }
 }
 
 TEST_F(UploadFileTest, RemovalThatFailsDoesNotChangeTheResult) {
-  FailCall("ALIBCExecl", 1, -1);
+  On("ALIBCExecl").Nth(1).Return(-1);
   Answer({.status = 500, .body = "oops"});
   EXPECT_EQ(Upload(List({File("coredump", kDump)})), -1);
   EXPECT_EQ(Log().back().message, "Fail to remove temp logs [/tmp/quendel/coredump]");
