@@ -86,7 +86,8 @@ void ReplaceAll(std::string& text, const std::string& what, const std::string& w
 std::string WithMarksFilled(std::string page, const std::string& sent) {
   const std::string opening = "«";
   const std::string closing = "»";
-  for (size_t at; (at = page.find(opening)) != std::string::npos;) {
+  // What was filled in may hold the bytes of a guillemet, so the search goes on behind it.
+  for (size_t at = 0; (at = page.find(opening, at)) != std::string::npos;) {
     const size_t end = page.find(closing, at);
     const std::string mark = page.substr(at, end + closing.size() - at);
     const size_t after = at + mark.size();
@@ -101,6 +102,7 @@ std::string WithMarksFilled(std::string page, const std::string& sent) {
       break;
     }
     ReplaceAll(page, mark, text);
+    at += text.size();
   }
   return page;
 }
@@ -146,7 +148,7 @@ int Heartbeat() {
 
 int SendArchive() {
   const std::string archive = "/tmp/quendel_20240305_080809_0.tar.xz";
-  WriteFile(archive, "any\r\n--bytes");
+  WriteFile(archive, "any\r\n--«bytes»");
   return QUENDELSendCollectData(archive.c_str(), 1709622489);
 }
 
