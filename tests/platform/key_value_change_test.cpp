@@ -29,6 +29,7 @@ using testing::IsEmpty;
 
 namespace {
 
+constexpr int kPollMilliseconds = 2;
 constexpr char kDir[] = "/tmp/settings";
 constexpr char kPath[] = "/tmp/settings/test.conf";
 
@@ -112,6 +113,13 @@ TEST(FileSetKeyValueTest, AddsAMissingKeyAtTheEnd) {
 
 TEST(FileSetKeyValueTest, EndsAnUnfinishedLastLineFirst) {
   EXPECT_EQ(After("a=1", "key", "value"), "a=1\nkey=value\n");
+}
+
+TEST(FileSetKeyValueTest, KeepsTheValueOfALastLineThatEndsInACarriageReturn) {
+  EXPECT_EQ(After("x=0\r\na=1\r", "b", "2"), "x=0\r\na=1\r\nb=2\r\n");
+  EXPECT_EQ(Get("a"), "1");
+  EXPECT_EQ(After("a=1\r", "b", "2"), "a=1\r\nb=2\n");
+  EXPECT_EQ(Get("a"), "1");
 }
 
 TEST(FileSetKeyValueTest, ReplacesAnUnfinishedLastLine) {
@@ -382,6 +390,29 @@ TEST(FileSetKeyValueTest, FailsWithoutALock) {
   EXPECT_EQ(ALIBCErrGet(), 0x0500);
   EXPECT_EQ(errno, ENOLCK);
   EXPECT_EQ(ReadFile(kPath), "key=old\n");
+}
+
+TEST(FileSetKeyValueTest, FailsAfterTenSecondsWhenSomebodyHoldsTheLock) {
+  WriteFile(kPath, "key=old\n");
+  const int lock = open("/tmp/settings/.test.conf.lock", O_RDWR | O_CREAT | O_CLOEXEC, 0600);
+  ASSERT_EQ(flock(lock, LOCK_EX), 0);
+  On("nanosleep").InPlatform().Return(0);  // which would wait
+  EXPECT_EQ(Set("key", "new"), -1);
+  EXPECT_EQ(ALIBCErrGet(), 0x0500);
+  EXPECT_EQ(errno, EWOULDBLOCK);
+  EXPECT_EQ(CallsInPlatform("nanosleep") * kPollMilliseconds, 10000);
+  EXPECT_EQ(ReadFile(kPath), "key=old\n");
+}
+
+TEST(FileSetKeyValueTest, FailsWhenTheLockIsExchangedAgainAndAgain) {
+  WriteFile(kPath, "key=old\n");
+  On("nanosleep").InPlatform().Return(0);
+  On("flock").InPlatform().Before([] {
+    WriteFile("/tmp/settings/other", "");
+    rename("/tmp/settings/other", "/tmp/settings/.test.conf.lock");
+  });
+  EXPECT_EQ(Set("key", "new"), -1);
+  EXPECT_EQ(ALIBCErrGet(), 0x0500);
 }
 
 TEST(FileSetKeyValueTest, FailsWhenWhatAKilledProcessLeftCannotBeRemoved) {

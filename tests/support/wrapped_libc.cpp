@@ -37,6 +37,7 @@ QUENDEL_WRAP(fdopen, FILE*, (int fd, const char* mode), Fd(fd), mode);
 QUENDEL_WRAP(flock, int, (int fd, int operation), Fd(fd), operation);
 QUENDEL_WRAP(fopen, FILE*, (const char* path, const char* mode), path, mode);
 QUENDEL_WRAP(fork, pid_t, ());
+QUENDEL_WRAP(fstat, int, (int fd, struct stat* status), Fd(fd), status);
 QUENDEL_WRAP(fsync, int, (int fd), Fd(fd));
 QUENDEL_WRAP(ftruncate, int, (int fd, off_t size), Fd(fd), size);
 QUENDEL_WRAP(gethostbyname, hostent*, (const char* name), name);
@@ -45,6 +46,7 @@ QUENDEL_WRAP(lseek, off_t, (int fd, off_t place, int from), Fd(fd), place, from)
 QUENDEL_WRAP(mkdir, int, (const char* path, mode_t mode), path, mode);
 QUENDEL_WRAP(mkdirat, int, (int directory, const char* name, mode_t mode), Fd(directory), name,
              mode);
+QUENDEL_WRAP(nanosleep, int, (const timespec* wanted, timespec* left), wanted, left);
 QUENDEL_WRAP(pread, ssize_t, (int fd, void* buf, size_t size, off_t place), Fd(fd), buf,
              Count(size), place);
 QUENDEL_WRAP(pwrite, ssize_t, (int fd, const void* buf, size_t size, off_t place), Fd(fd), buf,

@@ -21,10 +21,17 @@ const char* LineEndOf(const std::string& text) {
   return hasReturn ? "\r\n" : "\n";
 }
 
+// What the last line lacks to be ended. A CR at its end is half of a line end already: a second one
+// would become part of the value.
+const char* MissingLineEnd(const std::string& text) {
+  if (text.empty() || text.back() == '\n') {
+    return "";
+  }
+  return text.back() == '\r' ? "\n" : LineEndOf(text);
+}
+
 std::string WithPairAdded(const std::string& text, const char* key, const std::string& written) {
-  const char* const lineEnd = LineEndOf(text);
-  const bool endsInsideLine = !text.empty() && text.back() != '\n';
-  return text + (endsInsideLine ? lineEnd : "") + key + '=' + written + lineEnd;
+  return text + MissingLineEnd(text) + key + '=' + written + LineEndOf(text);
 }
 
 // Only the value changes: the key, the blanks around it and the line end stay.
