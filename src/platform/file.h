@@ -14,8 +14,8 @@ constexpr int kEnumRegularFiles = 130;
 
 extern "C" {
 
-// Returns 1 when the path exists, whatever it is; 0 when it does not, as a link to nothing; negative
-// when that cannot be told.
+// Returns 1 when the path exists, whatever it is; 0 when it does not, as a link to nothing;
+// negative when that cannot be told.
 int ALIBCFileExist(const char* path);
 
 // Returns 1 when the path is a directory, or a link to one; 0 when it is something else or does not
@@ -41,9 +41,9 @@ int ALIBCFileStat(const char* path, int flags, struct stat* status);
 int ALIBCFileTouch(const char* path);
 
 // Removes a directory and everything below it, at any depth. No symbolic link is followed, neither
-// below nor as the path itself, and no other file system that is mounted below is entered. What can
-// be removed is removed even when something cannot.
-// Returns 0 when nothing is left, negative on failure with errno of the first thing that stayed.
+// below nor as the path itself, and nothing that is mounted below is entered, be it of the same
+// file system. What can be removed is removed even when something cannot. Returns 0 when nothing is
+// left, negative on failure with errno of the first thing that stayed.
 int ALIBCopyRemoveDir(const char* path);
 
 // Copies the contents of a regular file to dst, which is created with the permissions of src, less

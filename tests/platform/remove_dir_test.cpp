@@ -147,6 +147,25 @@ TEST(RemoveDirTest, LeavesAMountedFileSystemAlone) {
   EXPECT_FALSE(Exists("/tmp/tree/z"));
 }
 
+TEST(RemoveDirTest, LeavesAFolderThatIsMountedFromTheSameFileSystemAlone) {
+  WriteFile("/tmp/elsewhere/below/file", "kept");
+  mkdir(kTree, 0700);
+  mkdir("/tmp/tree/bound", 0700);
+  ASSERT_EQ(mount("/tmp/elsewhere", "/tmp/tree/bound", nullptr, MS_BIND, nullptr), 0);
+  EXPECT_LT(ALIBCopyRemoveDir(kTree), 0);
+  EXPECT_EQ(errno, EBUSY);
+  EXPECT_EQ(ReadFile("/tmp/elsewhere/below/file"), "kept");
+}
+
+TEST(RemoveDirTest, EmptiesAFolderThatIsMountedItself) {
+  WriteFile("/tmp/elsewhere/below/file", "gone");
+  mkdir(kTree, 0700);
+  ASSERT_EQ(mount("/tmp/elsewhere", kTree, nullptr, MS_BIND, nullptr), 0);
+  EXPECT_LT(ALIBCopyRemoveDir(kTree), 0);
+  EXPECT_EQ(errno, EBUSY);
+  EXPECT_FALSE(Exists("/tmp/elsewhere/below"));
+}
+
 TEST(RemoveDirTest, PassesOverADirectoryThatSomebodyElseRemoves) {
   WriteFile("/tmp/tree/a/file", "");
   mkdir("/tmp/tree/a/b", 0700);

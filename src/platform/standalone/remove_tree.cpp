@@ -6,9 +6,11 @@
 #include <dirent.h>
 #include <fcntl.h>
 #include <sys/stat.h>
+#include <sys/sysmacros.h>
 #include <unistd.h>
 
 #include <cerrno>
+#include <cstdint>
 #include <memory>
 #include <string>
 #include <vector>
@@ -22,11 +24,22 @@ namespace {
 
 constexpr int kOpenDirectory = O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC;
 
+// Which directory this is, and by which mount it is seen: a folder that is mounted a second time is
+// the same directory there, but nothing that belongs to the tree.
+struct Place {
+  dev_t device;
+  uint64_t inode;
+  uint64_t mount;  // 0 where the kernel does not tell, before Linux 5.8
+
+  bool operator==(const Place& other) const {
+    return device == other.device && inode == other.inode && mount == other.mount;
+  }
+};
+
 // A directory on the way down from the top of the tree.
 struct Level {
   std::string name;  // in the directory above
-  dev_t device;
-  ino_t inode;
+  Place place;
   std::vector<std::string> directories;  // those directly below that are still to be removed
 };
 
@@ -46,6 +59,19 @@ class TreeRemoval {
   OwnedFd current_;
   std::vector<Level> levels_;
 };
+
+// Returns false with errno set on failure.
+bool FindPlace(const OwnedFd& directory, Place& place) {
+  struct statx status;
+  if (!directory ||
+      statx(directory.get(), "", AT_EMPTY_PATH, STATX_INO | STATX_MNT_ID, &status) != 0) {
+    return false;
+  }
+  place.device = makedev(status.stx_dev_major, status.stx_dev_minor);
+  place.inode = status.stx_ino;
+  place.mount = (status.stx_mask & STATX_MNT_ID) != 0 ? status.stx_mnt_id : 0;
+  return true;
+}
 
 bool IsDotName(const std::string& name) {
   return name == "." || name == "..";
@@ -96,18 +122,19 @@ void TreeRemoval::Enter(const std::string& name, OwnedFd directory) {
   if (!directory && errno == ENOENT) {
     return;  // somebody else was faster
   }
-  struct stat status;
-  if (!directory || fstat(directory.get(), &status) != 0) {
+  Place place = {};
+  if (!FindPlace(directory, place)) {
     Note(errno);
     return;
   }
-  if (!levels_.empty() && status.st_dev != levels_.back().device) {
-    // Another file system is mounted here: what it holds is not part of the tree.
+  if (!levels_.empty() &&
+      (place.device != levels_.back().place.device || place.mount != levels_.back().place.mount)) {
+    // Something is mounted here: what it holds is not part of the tree.
     Note(EBUSY);
     return;
   }
   current_ = std::move(directory);
-  levels_.push_back({name, status.st_dev, status.st_ino, {}});
+  levels_.push_back({name, place, {}});
   RemoveEntries(levels_.back());
 }
 
@@ -119,10 +146,8 @@ void TreeRemoval::Leave() {
     return;
   }
   OwnedFd above(openat(current_.get(), "..", kOpenDirectory));
-  struct stat status;
-  const Level& expected = levels_.back();
-  if (!above || fstat(above.get(), &status) != 0 || status.st_dev != expected.device ||
-      status.st_ino != expected.inode) {
+  Place place = {};
+  if (!FindPlace(above, place) || !(place == levels_.back().place)) {
     // Somebody moved the directory: nothing tells any more where this is.
     Note(above ? ESTALE : errno);
     levels_.clear();
