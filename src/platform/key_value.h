@@ -19,8 +19,8 @@ extern "C" {
 int ALIBCFileGetKeyValue(const char* path, const char* key, char* buf, int size, int flags);
 
 // Sets the value of one key, adding the key when the file lacks it and keeping everything else in
-// the file. The file must exist. The change is on the disk, whole or not at all, when this returns.
-// Returns positive on success, negative on failure.
+// the file. The file must exist. Another writer is waited for, 10 s at most. The change is on the
+// disk, whole or not at all, when this returns. Returns positive on success, negative on failure.
 int ALIBCFileSetKeyValue(const char* path, const char* key, const char* value, int flags);
 
 // Reads every pair of the file into a hash, over what the hash already holds.
@@ -40,7 +40,8 @@ int ALIBCFileEnumSection(const char* path, ALIBSZLIST** sections);
 
 // Reads the pairs of one section into a hash, over what the hash already holds. Where several
 // sections bear the name, a later one goes over an earlier one. Walking through a file's sections
-// in turn costs no more than reading the file once, as long as it does not change. Returns positive
+// in turn costs no more than reading the file once, when it has not changed for a tenth of a
+// second. Returns positive
 // on success; negative when there is no such section or the file cannot be read.
 int ALIBCFileGetSection(const char* path, const char* section, ALIBSZHASH** hash);
 }

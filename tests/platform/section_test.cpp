@@ -10,6 +10,7 @@
 #include <map>
 #include <random>
 #include <string>
+#include <thread>
 #include <vector>
 
 #include "containers.h"
@@ -56,6 +57,28 @@ TextMap SectionOf(const std::string& name) {
 bool HasSection(const std::string& name) {
   platform::OwnedHash hash(8);
   return ALIBCFileGetSection(kPath, name.c_str(), hash.slot()) > 0;
+}
+
+// Has files look as they do on a kernel with a tick of 4 ms and on a file system that gives the
+// number of a file that is gone to the next one.
+void MakeOld(struct stat& status) {
+  constexpr long kTickNanoseconds = 4'000'000;
+  status.st_mtim.tv_nsec -= status.st_mtim.tv_nsec % kTickNanoseconds;
+  status.st_ctim.tv_nsec -= status.st_ctim.tv_nsec % kTickNanoseconds;
+  status.st_ino = 12;
+}
+
+void BeOnAnOldSystem() {
+  On("stat").InPlatform().Replace([](const char* path, struct stat* status) {
+    const int result = stat(path, status);
+    MakeOld(*status);
+    return result;
+  });
+  On("fstat").InPlatform().Replace([](int fd, struct stat* status) {
+    const int result = fstat(fd, status);
+    MakeOld(*status);
+    return result;
+  });
 }
 
 const TextMap kState = {{"inode", "1835017"},
@@ -334,6 +357,26 @@ TEST(FileGetSectionTest, SeesEveryChangeOfTheFile) {
   platform::OwnedHash hash(8);
   EXPECT_GT(ALIBCFileGetSection("/tmp/quendel/other.conf", "a", hash.slot()), 0);
   EXPECT_EQ(Pairs(hash)["x"], "4");
+}
+
+TEST(FileGetSectionTest, NeverShowsAFileThatIsNoMore) {
+  BeOnAnOldSystem();
+  for (int round = 0; round < 500; ++round) {
+    WriteFile(kPath, "[a]\nx=1\n[b]\n");
+    EXPECT_EQ(SectionOf("a")["x"], "1");
+    RemoveFile(kPath);
+    WriteFile(kPath, "[a]\nx=2\n[b]\n");
+    EXPECT_EQ(SectionOf("a")["x"], "2");
+  }
+}
+
+TEST(FileGetSectionTest, SeesAChangeOfAFileThatItRemembers) {
+  BeOnAnOldSystem();
+  WriteFile(kPath, "[a]\nx=1\n[b]\n");
+  std::this_thread::sleep_for(std::chrono::milliseconds(150));
+  EXPECT_EQ(SectionOf("a")["x"], "1");
+  WriteFile(kPath, "[a]\nx=2\n[b]\n");
+  EXPECT_EQ(SectionOf("a")["x"], "2");
 }
 
 TEST(FileGetSectionTest, WalksThroughManySectionsInLinearTime) {

@@ -6,9 +6,11 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <chrono>
 #include <cstdio>
 #include <cstdlib>
 #include <memory>
+#include <thread>
 
 #include "platform/standalone/error_code.h"
 
@@ -16,6 +18,12 @@ namespace platform {
 namespace {
 
 constexpr mode_t kPrivateMode = 0600;
+
+// How long a writer waits for another one: 10 s. Whoever may write to the folder could hold the
+// lock for ever.
+constexpr auto kPollInterval = std::chrono::milliseconds(2);
+constexpr int kMaxPolls = 5000;
+
 // What is left of the 255 bytes that a file name may have, less the dot and the longest suffix.
 constexpr size_t kMaxNamePartBytes = 240;
 
@@ -42,11 +50,14 @@ bool NamesThisFile(const char* path, int fd) {
          named.st_ino == open.st_ino;
 }
 
-bool WaitForLock(int fd) {
-  while (flock(fd, LOCK_EX) != 0) {
-    if (errno != EINTR) {
+// Waits for the lock on a file, for as many polls as are left. Returns false with errno set when it
+// was not to be had.
+bool WaitForLock(int fd, int& pollsLeft) {
+  while (flock(fd, LOCK_EX | LOCK_NB) != 0) {
+    if (errno != EWOULDBLOCK || pollsLeft-- <= 0) {
       return false;
     }
+    std::this_thread::sleep_for(kPollInterval);
   }
   return true;
 }
@@ -110,16 +121,21 @@ int ChangeLockedFile(const std::string& path, const Change& change) {
 }  // namespace
 
 FileLock::FileLock(const std::string& target) : path_(HiddenNameBeside(target, ".lock")) {
-  for (;;) {
+  for (int pollsLeft = kMaxPolls;;) {
     OwnedFd file(
         open(path_.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK, kPrivateMode));
-    if (!file || !WaitForLock(file.get())) {
+    if (!file || !WaitForLock(file.get(), pollsLeft)) {
       Fail(kErrorLockFailed);
       return;
     }
     // The holder before us may have removed the file that we waited for.
     if (NamesThisFile(path_.c_str(), file.get())) {
       file_ = std::move(file);
+      return;
+    }
+    if (pollsLeft-- <= 0) {
+      errno = EWOULDBLOCK;
+      Fail(kErrorLockFailed);
       return;
     }
   }

@@ -16,7 +16,8 @@ namespace platform {
 // process left behind is taken over.
 class FileLock {
  public:
-  // Waits for the lock. The lock is false, with the last error set, when it could not be taken.
+  // Waits for the lock, 10 s at most. The lock is false, with the last error set, when it could not
+  // be taken.
   explicit FileLock(const std::string& target);
   ~FileLock();
   FileLock(const FileLock&) = delete;

@@ -5,7 +5,9 @@
 
 #include <cerrno>
 #include <charconv>
+#include <cstdint>
 #include <cstring>
+#include <ctime>
 #include <memory>
 #include <string>
 #include <unordered_map>
@@ -39,8 +41,13 @@ struct Range {
 
 // The whole sections of one file, as they stood when this thread last read it. A commit asks for
 // one section after the other: without this, each would cost reading the whole file.
+//
+// Only a file that had been left alone for some time is remembered. What happens to one within a
+// tick of the clock that stamps it may not show in its status; such a file is read again each time,
+// until the ticks have passed.
 struct SectionIndex {
   struct stat status = {};
+  bool settled = false;  // so that what comes shows in the status
   std::string text;
   std::vector<std::string> names;
   std::unordered_map<std::string, std::vector<Range>> ranges;
@@ -115,9 +122,22 @@ bool IsUnchanged(const struct stat& a, const struct stat& b) {
          IsSameMoment(a.st_mtim, b.st_mtim) && IsSameMoment(a.st_ctim, b.st_ctim);
 }
 
+// The longest tick of a kernel's clock is 10 ms.
+bool IsSettled(const struct stat& status) {
+  constexpr int64_t kSettledNanoseconds = 100'000'000;
+  struct timespec now;
+  clock_gettime(CLOCK_REALTIME, &now);
+  const int64_t age = (now.tv_sec - status.st_ctim.tv_sec) * int64_t{1'000'000'000} +
+                      (now.tv_nsec - status.st_ctim.tv_nsec);
+  // A change that is still to come cannot get a time that is passed, nor one that the clock has
+  // been set back from.
+  return age < 0 || age >= kSettledNanoseconds;
+}
+
 bool IsIndexed(const char* path) {
   struct stat status;
-  return lastIndex && stat(path, &status) == 0 && IsUnchanged(lastIndex->status, status);
+  return lastIndex && lastIndex->settled && stat(path, &status) == 0 &&
+         IsUnchanged(lastIndex->status, status);
 }
 
 // Returns the index of a file, or null with the last error set when the file cannot be read.
@@ -128,6 +148,7 @@ const SectionIndex* IndexOf(const char* path) {
   lastIndex.reset();
   auto index = std::make_unique<SectionIndex>();
   const OwnedFd file = OpenForReading(path, index->status);
+  index->settled = file && IsSettled(index->status);
   if (!file || !ReadToEnd(file.get(), index->status.st_size, index->text)) {
     return nullptr;
   }
