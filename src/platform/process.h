@@ -6,8 +6,9 @@
 // and none blocked.
 //
 // A status is the program's exit status, or 128 + the number of the signal that ended it; -1 means
-// that the program was never started, and errno says why. The caller must not ignore SIGCHLD or
-// reap the child itself: the status is lost then, which gives -1 with errno ECHILD.
+// that the program was never started, and errno says why. A caller that ignores SIGCHLD gets the
+// status all the same, by way of a helper process, and goes on ignoring it. One that reaps the
+// child itself loses the status, which gives -1 with errno ECHILD.
 #ifndef PLATFORM_PROCESS_H_
 #define PLATFORM_PROCESS_H_
 

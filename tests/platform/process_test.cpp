@@ -205,9 +205,97 @@ TEST(ExecTest, WaitsForTheProgramOnly) {
   EXPECT_LT(std::chrono::steady_clock::now() - begin, std::chrono::seconds(30));
 }
 
-TEST(ExecTest, SaysThatAStatusIsLostWhenChildrenAreIgnored) {
+TEST(ExecTest, SaysThatAStatusIsLostWhenSomebodyElseReapsTheChild) {
   MakeProgram("exit 0");
+  On("waitpid").InPlatform().Nth(1).Return(-1, ECHILD);
+  EXPECT_EQ(RunProgram(), -1);
+  EXPECT_EQ(ALIBCErrGet(), 0x0801);
+  EXPECT_EQ(errno, ECHILD);
+}
+
+// ---- A caller that does not want to know of its children's ends ----
+
+// The two ways to say so. Each leaves no zombies.
+void IgnoreChildren() {
   signal(SIGCHLD, SIG_IGN);
+}
+
+void WantNoZombies() {
+  struct sigaction action = {};
+  action.sa_handler = SIG_DFL;
+  action.sa_flags = SA_NOCLDWAIT;
+  sigaction(SIGCHLD, &action, nullptr);
+}
+
+// Tells whether the process still says it in the same way, and has no child left.
+void ExpectNothingChanged(void (*how)()) {
+  struct sigaction action = {};
+  sigaction(SIGCHLD, nullptr, &action);
+  EXPECT_EQ(action.sa_handler == SIG_IGN, how == IgnoreChildren);
+  EXPECT_EQ((action.sa_flags & SA_NOCLDWAIT) != 0, how == WantNoZombies);
+  EXPECT_EQ(waitpid(-1, nullptr, 0), -1);  // waits for the last of them
+  EXPECT_EQ(errno, ECHILD);
+}
+
+class IgnoredChildrenTest : public testing::TestWithParam<void (*)()> {
+ protected:
+  void SetUp() override { GetParam()(); }
+  void TearDown() override { ExpectNothingChanged(GetParam()); }
+};
+
+INSTANTIATE_TEST_SUITE_P(Both, IgnoredChildrenTest, testing::Values(IgnoreChildren, WantNoZombies));
+
+TEST_P(IgnoredChildrenTest, LoseNoStatus) {
+  const int before = FreeDescriptor();
+  for (const auto& [lines, status] :
+       {std::pair("exit 0", 0), std::pair("exit 7", 7), std::pair("kill -9 $$", 137)}) {
+    MakeProgram(lines);
+    EXPECT_EQ(RunProgram(), status);
+    EXPECT_EQ(ALIBCExecl(kProgram, 187, nullptr), status);
+    int streamStatus = -1;
+    EXPECT_EQ(Say(&streamStatus), "");
+    EXPECT_EQ(streamStatus, status);
+  }
+  EXPECT_EQ(FreeDescriptor(), before);
+}
+
+TEST_P(IgnoredChildrenTest, AreReadToTheirEnd) {
+  MakeProgram("echo all of it; exec >&-; exit 3");
+  int status = -1;
+  EXPECT_EQ(Say(&status), "all of it\n");
+  EXPECT_EQ(status, 3);
+}
+
+TEST_P(IgnoredChildrenTest, ThatCannotBeStartedSayWhy) {
+  EXPECT_EQ(ALIBCExec("/tmp/nowhere", nullptr, nullptr, nullptr, nullptr), -1);
+  EXPECT_EQ(errno, ENOENT);
+  EXPECT_EQ(ALIBCErrGet(), 0x0800);
+  EXPECT_EQ(ALIBCPopen("/tmp/nowhere", "r", nullptr), nullptr);
+  EXPECT_EQ(errno, ENOENT);
+}
+
+TEST_P(IgnoredChildrenTest, GetWhatOtherProgramsGet) {
+  signal(SIGUSR1, SIG_IGN);
+  EXPECT_EQ(ALIBCExec("/bin/cp", "/proc/self/status", kSaid, nullptr, nullptr), 0);
+  EXPECT_THAT(ReadFile(kSaid), HasSubstr("SigBlk:\t0000000000000000\n"));
+  EXPECT_THAT(ReadFile(kSaid), HasSubstr("SigIgn:\t0000000180000000\n"));
+  const int open3 = open("/dev/null", O_RDONLY);
+  MakeProgram("ls /proc/$$/fd >" + std::string(kSaid) + ".fd");
+  EXPECT_EQ(RunProgram(), 0);
+  EXPECT_THAT(ReadFile(std::string(kSaid) + ".fd"), testing::Not(HasSubstr("3\n")));
+  close(open3);
+}
+
+// The helper is in the caller's group, which a collection run signals as a whole.
+TEST_P(IgnoredChildrenTest, TellThatASignalToTheGroupEndedThem) {
+  setpgid(0, 0);
+  MakeProgram("kill -TERM 0; sleep 5");
+  signal(SIGTERM, SIG_IGN);
+  EXPECT_EQ(RunProgram(), 128 + SIGTERM);
+}
+
+TEST_P(IgnoredChildrenTest, LoseTheirStatusWithTheirHelper) {
+  MakeProgram("kill -9 $PPID; sleep 0.1");
   EXPECT_EQ(RunProgram(), -1);
   EXPECT_EQ(ALIBCErrGet(), 0x0801);
   EXPECT_EQ(errno, ECHILD);

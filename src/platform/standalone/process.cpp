@@ -2,78 +2,24 @@
 #include "platform/process.h"
 
 #include <fcntl.h>
-#include <spawn.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <cerrno>
-#include <csignal>
 #include <cstdarg>
 #include <cstring>
 #include <memory>
 #include <mutex>
 #include <unordered_map>
+#include <utility>
 #include <vector>
 
 #include "platform/standalone/error_code.h"
 #include "platform/standalone/file_io.h"
 #include "platform/standalone/run_program.h"
+#include "platform/standalone/started_program.h"
 
 namespace platform {
 namespace {
-
-constexpr char kNullDevice[] = "/dev/null";
-constexpr int kFirstOtherDescriptor = 3;
-
-// The actions and attributes of a start; both hold memory that must be given back.
-class SpawnPlan {
- public:
-  SpawnPlan() {
-    posix_spawn_file_actions_init(&actions_);
-    posix_spawnattr_init(&attributes_);
-  }
-  ~SpawnPlan() {
-    posix_spawn_file_actions_destroy(&actions_);
-    posix_spawnattr_destroy(&attributes_);
-  }
-  SpawnPlan(const SpawnPlan&) = delete;
-  SpawnPlan& operator=(const SpawnPlan&) = delete;
-
-  // Gives the child its three streams, of which `output` is /dev/null when it is negative, and no
-  // other descriptor. Returns an error number, 0 when all is well.
-  int SetStreams(int output) {
-    int error = posix_spawn_file_actions_addopen(&actions_, STDIN_FILENO, kNullDevice, O_RDONLY, 0);
-    if (error == 0 && output < 0) {
-      error = posix_spawn_file_actions_addopen(&actions_, STDOUT_FILENO, kNullDevice, O_WRONLY, 0);
-    } else if (error == 0) {
-      error = posix_spawn_file_actions_adddup2(&actions_, output, STDOUT_FILENO);
-    }
-    if (error == 0) {
-      error = posix_spawn_file_actions_addopen(&actions_, STDERR_FILENO, kNullDevice, O_WRONLY, 0);
-    }
-    return error != 0 ? error
-                      : posix_spawn_file_actions_addclosefrom_np(&actions_, kFirstOtherDescriptor);
-  }
-
-  // Signals that this process ignores or blocks are its own affair, not its programs'.
-  void ResetSignals() {
-    sigset_t all;
-    sigset_t none;
-    sigfillset(&all);
-    sigemptyset(&none);
-    posix_spawnattr_setsigdefault(&attributes_, &all);
-    posix_spawnattr_setsigmask(&attributes_, &none);
-    posix_spawnattr_setflags(&attributes_, POSIX_SPAWN_SETSIGDEF | POSIX_SPAWN_SETSIGMASK);
-  }
-
-  int Start(pid_t* child, const std::vector<char*>& argv) const {
-    return posix_spawn(child, argv[0], &actions_, &attributes_, argv.data(), environ);
-  }
-
- private:
-  posix_spawn_file_actions_t actions_;
-  posix_spawnattr_t attributes_;
-};
 
 // An argument vector of the program and what follows it up to a null pointer. posix_spawn() takes
 // pointers to non-const for the sake of old callers; it does not write there.
@@ -96,60 +42,34 @@ class Arguments {
   std::vector<char*> argv_;
 };
 
-// Returns the child's id, or -1 with errno and the last error set.
-pid_t Start(const std::vector<char*>& argv, int output) {
-  SpawnPlan plan;
-  plan.ResetSignals();
-  pid_t child = -1;
-  int error = plan.SetStreams(output);
-  if (error == 0) {
-    error = plan.Start(&child, argv);
-  }
-  if (error != 0) {
-    errno = error;
-    return Fail(kErrorNotStarted);
-  }
-  return child;
-}
-
-int WaitForStatus(pid_t child) {
-  int status = 0;
-  while (waitpid(child, &status, 0) < 0) {
-    if (errno != EINTR) {
-      return Fail(kErrorStatusLost);
-    }
-  }
-  return WIFSIGNALED(status) ? 128 + WTERMSIG(status) : WEXITSTATUS(status);
-}
-
 int Run(const std::vector<char*>& argv) {
-  const pid_t child = Start(argv, -1);
-  return child < 0 ? -1 : WaitForStatus(child);
+  const StartedProgram program = StartProgram(argv, -1);
+  return program ? WaitForStatus(program) : -1;
 }
 
 // The programs behind the streams that are open.
 class StreamTable {
  public:
-  void Set(FILE* stream, pid_t child) {
+  void Set(FILE* stream, StartedProgram program) {
     const std::lock_guard<std::mutex> guard(mutex_);
-    children_[stream] = child;
+    programs_[stream] = std::move(program);
   }
 
-  // Returns the child's id, or -1 for a stream that is not in the table.
-  pid_t Remove(FILE* stream) {
+  // Returns no program for a stream that is not in the table.
+  StartedProgram Remove(FILE* stream) {
     const std::lock_guard<std::mutex> guard(mutex_);
-    const auto found = children_.find(stream);
-    if (found == children_.end()) {
-      return -1;
+    const auto found = programs_.find(stream);
+    if (found == programs_.end()) {
+      return {};
     }
-    const pid_t child = found->second;
-    children_.erase(found);
-    return child;
+    StartedProgram program = std::move(found->second);
+    programs_.erase(found);
+    return program;
   }
 
  private:
   std::mutex mutex_;
-  std::unordered_map<FILE*, pid_t> children_;
+  std::unordered_map<FILE*, StartedProgram> programs_;
 };
 
 StreamTable& Streams() {
@@ -180,13 +100,13 @@ FILE* OpenStream(const std::vector<char*>& argv) {
   }
   readEnd.Release();
   // Once the stream has its place in the table nothing can fail behind the start.
-  Streams().Set(stream.get(), -1);
-  const pid_t child = Start(argv, writeEnd.get());
-  if (child < 0) {
+  Streams().Set(stream.get(), {});
+  StartedProgram program = StartProgram(argv, writeEnd.get());
+  if (!program) {
     Streams().Remove(stream.get());
     return nullptr;
   }
-  Streams().Set(stream.get(), child);
+  Streams().Set(stream.get(), std::move(program));
   return stream.release();
 }
 
@@ -257,10 +177,10 @@ FILE* ALIBCPopen(const char* program, const char* mode, ...) try {
 }
 
 int ALIBCPclose(FILE* stream) {
-  const pid_t child = platform::Streams().Remove(stream);
-  if (child < 0) {
+  const platform::StartedProgram program = platform::Streams().Remove(stream);
+  if (!program) {
     return platform::FailForArgument();
   }
   fclose(stream);
-  return platform::WaitForStatus(child);
+  return platform::WaitForStatus(program);
 }

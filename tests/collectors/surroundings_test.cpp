@@ -1,8 +1,10 @@
-// Files that cannot be examined: they are there as far as anybody knows, so nothing may be
-// overwritten, passed over or forgotten because of it.
+// What the collectors' surroundings must not cost: files that cannot be examined are there as far
+// as anybody knows, so nothing may be overwritten, passed over or forgotten because of it; and a
+// caller may ignore its children.
 #include <gmock/gmock.h>
 
 #include <cerrno>
+#include <csignal>
 #include <string>
 
 #include "model/collector_files.h"
@@ -99,6 +101,15 @@ TEST(CollectLogTest, FailsALogWithAFileThatCannotBeExamined) {
            Logged(kLogUnit, "Failed to get the inode of tared logs of '/volume1/logs/messages'"),
            Logged(kLogUnit, "Failed to collect tared log of '" + conf + "'"),
            Logged(kLogUnit, "Failed to collect log in conf '" + conf + "'")}));
+}
+
+TEST(CollectLogTest, TakesTheLinesOfAnArchiveWhileItsCallerIgnoresItsChildren) {
+  InstallRotated();
+  signal(SIGCHLD, SIG_IGN);
+  std::string arrived;
+  Deliver(arrived);
+  EXPECT_EQ(arrived, "two\nthree\n");
+  EXPECT_EQ(signal(SIGCHLD, SIG_DFL), SIG_IGN);
 }
 
 TEST(ResetLogConfTest, FailsForAFileThatCannotBeExamined) {
