@@ -50,3 +50,13 @@ if(QUENDEL_BUILD_QUENDELCTL)
   install(TARGETS quendelctl RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR})
   install(FILES docs/man/quendelctl.1 DESTINATION ${CMAKE_INSTALL_MANDIR}/man1)
 endif()
+if(QUENDEL_BUILD_DESK)
+  install(TARGETS quendel-desk RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR})
+  install(FILES docs/man/quendel-desk.1 DESTINATION ${CMAKE_INSTALL_MANDIR}/man1)
+  install(FILES programs/quendel-desk/openapi.json
+    DESTINATION ${CMAKE_INSTALL_DATADIR}/quendel-desk)
+  # Where systemd looks, below the prefix.
+  configure_file(packaging/quendel-desk.service.in quendel-desk.service @ONLY)
+  install(FILES ${CMAKE_CURRENT_BINARY_DIR}/quendel-desk.service
+    DESTINATION lib/systemd/system)
+endif()
