@@ -55,8 +55,5 @@ if(QUENDEL_BUILD_DESK)
   install(FILES docs/man/quendel-desk.1 DESTINATION ${CMAKE_INSTALL_MANDIR}/man1)
   install(FILES programs/quendel-desk/openapi.json
     DESTINATION ${CMAKE_INSTALL_DATADIR}/quendel-desk)
-  # Where systemd looks, below the prefix.
-  configure_file(packaging/quendel-desk.service.in quendel-desk.service @ONLY)
-  install(FILES ${CMAKE_CURRENT_BINARY_DIR}/quendel-desk.service
-    DESTINATION lib/systemd/system)
+  install(FILES packaging/quendel-desk.service DESTINATION lib/systemd/system)
 endif()

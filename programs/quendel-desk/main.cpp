@@ -34,7 +34,8 @@ void DeclareServing(CLI::App& app, Settings& settings) {
       ->capture_default_str();
   app.add_option("--enrolment", settings.enrolment,
                  "How a new device comes in: open, list or approval (open)")
-      ->transform(CLI::CheckedTransformer(enrolments));
+      ->transform(CLI::CheckedTransformer(enrolments))
+      ->option_text("HOW");
   app.add_option("--max-upload", settings.most_upload_mib, "Most MiB in one delivery")
       ->capture_default_str();
   app.add_option("--min-free", settings.least_free_mib, "MiB of disk that files leave free")
