@@ -1,0 +1,86 @@
+// quendeld: the daemon of the remote support service.
+#include <fcntl.h>
+#include <sys/file.h>
+#include <sys/stat.h>
+#include <syslog.h>
+#include <unistd.h>
+
+#include <CLI/CLI.hpp>
+#include <csignal>
+#include <exception>
+#include <filesystem>
+
+#include "daemon.h"
+#include "quendel/version.h"
+
+namespace quendeld {
+namespace {
+
+constexpr char kLockFile[] = "/run/quendel/quendeld.lock";
+constexpr int kAlreadyRuns = 3;
+
+// What the loop takes must not come otherwise, and a reader that has gone is no reason to end.
+void PrepareSignals() {
+  sigset_t taken;
+  sigemptyset(&taken);
+  for (const int number : {SIGTERM, SIGINT, SIGHUP}) {
+    sigaddset(&taken, number);
+  }
+  sigprocmask(SIG_BLOCK, &taken, nullptr);
+  signal(SIGPIPE, SIG_IGN);
+  signal(SIGCHLD, SIG_DFL);
+}
+
+// One daemon at a time: it holds the lock until it ends, however it ends.
+bool TakeLock() {
+  mkdir("/run/quendel", 0755);
+  const int file = open(kLockFile, O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600);
+  return file >= 0 && flock(file, LOCK_EX | LOCK_NB) == 0;
+}
+
+void OccupyStandardDescriptors() {
+  while (true) {
+    const int null = open("/dev/null", O_RDWR | O_CLOEXEC);
+    if (null > STDERR_FILENO || null < 0) {
+      close(null);
+      return;
+    }
+    fcntl(null, F_SETFD, 0);
+  }
+}
+
+int Run(const DaemonOptions& options) {
+  if (!TakeLock()) {
+    syslog(LOG_ERR, "a quendeld runs already");
+    return kAlreadyRuns;
+  }
+  PrepareSignals();
+  Loop loop;
+  Daemon daemon(loop, options);
+  daemon.Start();
+  loop.Run();
+  syslog(LOG_NOTICE, "quendeld ends");
+  return 0;
+}
+
+}  // namespace
+}  // namespace quendeld
+
+int main(int argc, char** argv) {
+  quendeld::OccupyStandardDescriptors();
+  CLI::App app("quendeld - the daemon of the remote support service", "quendeld");
+  quendeld::DaemonOptions options;
+  options.settings = quendeld::kSettingsFile;
+  options.worker = QUENDEL_WORKER;
+  app.add_flag("--foreground", options.foreground, "Log to the standard error output as well");
+  app.add_option("--worker", options.worker, "The program that does the work")->type_name("FILE");
+  app.set_version_flag("--version", "quendeld " QUENDEL_VERSION, "Print the version and exit");
+  CLI11_PARSE(app, argc, argv);
+  openlog("quendeld", LOG_PID | (options.foreground ? LOG_PERROR : 0), LOG_DAEMON);
+  try {
+    return quendeld::Run(options);
+  } catch (const std::exception& error) {
+    syslog(LOG_ERR, "cannot run: %s", error.what());
+    return 1;
+  }
+}
