@@ -12,6 +12,7 @@
 #include "arguments.h"
 #include "base/paths.h"
 #include "command.h"
+#include "daemon_commands.h"
 #include "progress.h"
 #include "quendel.h"
 #include "run_watch.h"
@@ -25,6 +26,7 @@ namespace fs = std::filesystem;
 struct CollectArguments {
   bool send = false;
   bool keep = false;
+  bool now = false;
   std::string perf;
 };
 
@@ -178,7 +180,15 @@ Action DeclareCollect(CLI::App& command) {
                   "Performance series to put in, as perf --series prints it: a\n"
                   "file (- is the standard input) or a JSON object")
       ->type_name("FILE|JSON");
-  return [arguments] { return RunCollection(*arguments); };
+  command.add_flag("--now", arguments->now,
+                   "Have quendeld collect and send, and wait until it has");
+  return [arguments] {
+    const bool hasOthers = arguments->send || arguments->keep || !arguments->perf.empty();
+    if (arguments->now && hasOthers) {
+      throw CLI::ValidationError("--now", "leaves everything else to quendeld");
+    }
+    return arguments->now ? HaveDaemonCollect() : RunCollection(*arguments);
+  };
 }
 
 struct TarArguments {

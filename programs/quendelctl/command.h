@@ -6,6 +6,7 @@
 
 #include <CLI/CLI.hpp>
 #include <functional>
+#include <optional>
 #include <string>
 #include <vector>
 
@@ -17,6 +18,7 @@ struct Result {
   Json::Value members = Json::objectValue;  // printed with --json, together with "success"
   std::vector<std::string> lines;           // printed without; may hold any bytes
   std::string bytes;                        // likewise, but as they are, to anything but a terminal
+  std::optional<int> exit_status = {};      // when it is not 0 for success and 1 for failure
   bool keeps_process = false;               // once it is printed, until a signal ends the process
 };
 
@@ -43,6 +45,7 @@ Action DeclareGroup(CLI::App& group, const std::vector<Command>& commands);
 std::vector<Command> CollectionCommands();
 std::vector<Command> CollectorCommands();
 std::vector<Command> ConversationCommands();
+std::vector<Command> DaemonCommands();
 std::vector<Command> DeviceCommands();
 std::vector<Command> PerformanceCommands();
 std::vector<Command> RemoteCommands();

@@ -4,6 +4,7 @@
 
 #include "arguments.h"
 #include "command.h"
+#include "daemon_commands.h"
 #include "output.h"
 #include "quendel.h"
 
@@ -38,8 +39,10 @@ Result SendHeartbeat() {
   return result;
 }
 
-Action DeclareHeartbeat(CLI::App& /*command*/) {
-  return SendHeartbeat;
+Action DeclareHeartbeat(CLI::App& command) {
+  const auto now = std::make_shared<bool>(false);
+  command.add_flag("--now", *now, "Have quendeld send its next one now, and act on what it gets");
+  return [now] { return *now ? HaveDaemonBeat() : SendHeartbeat(); };
 }
 
 struct EventArguments {
@@ -64,6 +67,11 @@ Result ReportEvent(const EventArguments& arguments) {
       throw CLI::ValidationError("--info", "goes with the event enable only");
     }
     info = ReadJson("--info", arguments.info);
+  }
+  if (event == QUENDEL_EVENT_LOGOUT) {
+    if (const std::optional<Result> told = HaveDaemonSendLogout()) {
+      return *told;
+    }
   }
   Result result;
   Json::Value reply;

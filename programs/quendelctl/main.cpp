@@ -29,8 +29,9 @@ Exit status: 0 success, 1 the operation failed, 2 the command line is wrong.
 The reasons of a failure go to the standard error output and to the system's log.)";
 
 constexpr std::vector<Command> (*kFamilies[])() = {
-    ConversationCommands, CollectionCommands, PerformanceCommands, CollectorCommands,
-    UploadCommands,       RemoteCommands,     ShmCommands,         DeviceCommands};
+    ConversationCommands, CollectionCommands, PerformanceCommands,
+    CollectorCommands,    UploadCommands,     RemoteCommands,
+    ShmCommands,          DeviceCommands,     DaemonCommands};
 
 // What the command line asked for.
 struct Request {
@@ -108,7 +109,7 @@ int Run(int argc, char** argv) {
         pause();
       }
     }
-    return result.success ? kExitSuccess : kExitFailed;
+    return result.exit_status.value_or(result.success ? kExitSuccess : kExitFailed);
   } catch (const CLI::ParseError& error) {
     return AnswerParser(app, error);
   }

@@ -8,6 +8,7 @@
 #include "arguments.h"
 #include "base/paths.h"
 #include "command.h"
+#include "daemon_commands.h"
 #include "quendel.h"
 #include "session_file.h"
 
@@ -121,6 +122,9 @@ Result CloseSession(const CloseArguments& arguments) {
   const int id = ReadNumber("ID", arguments.id);
   const QuendelActionProgress_t progress =
       arguments.failed ? QUENDEL_ACT_PROGRESS_FAILED : QUENDEL_ACT_PROGRESS_DONE;
+  if (const std::optional<Result> closed = HaveDaemonCloseSession(id, progress)) {
+    return *closed;
+  }
   Result result;
   result.success = QUENDELRemoteClose(id, progress) == 0;
   result.lines = {result.success
