@@ -49,6 +49,13 @@ void OccupyStandardDescriptors() {
   }
 }
 
+// Both are installed as one tree, which may lie anywhere.
+std::string WorkerBesideMe() {
+  std::error_code error;
+  const std::filesystem::path me = std::filesystem::read_symlink("/proc/self/exe", error);
+  return (me.parent_path() / QUENDEL_WORKER_FROM_DAEMON).lexically_normal();
+}
+
 int Run(const DaemonOptions& options) {
   if (!TakeLock()) {
     syslog(LOG_ERR, "a quendeld runs already");
@@ -71,7 +78,7 @@ int main(int argc, char** argv) {
   CLI::App app("quendeld - the daemon of the remote support service", "quendeld");
   quendeld::DaemonOptions options;
   options.settings = quendeld::kSettingsFile;
-  options.worker = QUENDEL_WORKER;
+  options.worker = quendeld::WorkerBesideMe();
   app.add_flag("--foreground", options.foreground, "Log to the standard error output as well");
   app.add_option("--worker", options.worker, "The program that does the work")->type_name("FILE");
   app.set_version_flag("--version", "quendeld " QUENDEL_VERSION, "Print the version and exit");

@@ -25,7 +25,11 @@ const std::vector<std::string> kCommands = {"heartbeat",
                                             "server",
                                             "test-connection",
                                             "facts",
-                                            "version"};
+                                            "version",
+                                            "status",
+                                            "history",
+                                            "pause",
+                                            "resume"};
 
 // Those of them that do something, and the commands of the others.
 const std::vector<std::vector<std::string>> kDoers = {{"heartbeat"},
@@ -47,7 +51,11 @@ const std::vector<std::vector<std::string>> kDoers = {{"heartbeat"},
                                                       {"server"},
                                                       {"test-connection"},
                                                       {"facts"},
-                                                      {"version"}};
+                                                      {"version"},
+                                                      {"status"},
+                                                      {"history"},
+                                                      {"pause"},
+                                                      {"resume"}};
 
 std::string Joined(const std::vector<std::string>& words) {
   std::string text;

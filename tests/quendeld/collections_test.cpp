@@ -8,6 +8,7 @@
 #include <filesystem>
 #include <fstream>
 
+#include "received.h"
 #include "running_daemon.h"
 #include "support/appliance.h"
 #include "support/server.h"
@@ -53,34 +54,6 @@ class QuendeldCollectionsTest : public testing::Test {
     Append("first");
   }
 };
-
-// Says what each received archive holds of the log, one after the other.
-std::string Received() {
-  RemoveFile("/tmp/received");
-  std::string text;
-  int number = 0;
-  for (const std::string& file : RequestFiles()) {
-    std::ifstream request(file, std::ios::binary);
-    std::string first;
-    std::getline(request, first);
-    if (first.rfind("POST /collect/", 0) != 0) {
-      continue;
-    }
-    const std::string folder = "/tmp/received/" + std::to_string(++number);
-    fs::create_directories(folder);
-    const std::string command =
-        "perl -0777 -ne '/boundary=([^\\r\\n;]+)/; my $b = $1; for my $p (split /\\r\\n--\\Q$b\\E/) { "
-        "my ($h, $d) = split /\\r\\n\\r\\n/, $p, 2; next unless defined $d && $h =~ "
-        "/filename=\"([^\"\\/]+)\"/; open my $f, \">:raw\", \"" +
-        folder + "/a.tar.xz\"; print $f $d; }' " + file + " && tar -xJf " + folder +
-        "/a.tar.xz -C " + folder + " --strip-components 1 && cat " + folder +
-        "/log/one 2>/dev/null >" + folder + "/text; for a in " + folder +
-        "/log/*.xz; do [ ! -e $a ] || xz -dc $a >>" + folder + "/text; done";
-    EXPECT_EQ(system(command.c_str()), 0);
-    text += ReadFile(folder + "/text");
-  }
-  return text;
-}
 
 TEST_F(QuendeldCollectionsTest, RunsAtTheStartAndAtTheInterval) {
   RunningDaemon daemon({{"collection_interval", "3"}});
