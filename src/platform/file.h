@@ -32,8 +32,9 @@ int ALIBCFileUnlock(int lockId);
 // as it was.
 int ALIBCFileEnumDir(const char* dir, const char* prefix, ALIBSZLIST** names, int flags);
 
-// Gives what stat() tells of a path. `flags` is always 1: links are followed.
-// Returns 0, or negative on failure.
+// Gives what stat() tells of a path; the inode number is what tells the file from others, of which
+// a collected log's record keeps the low 32 bits. `flags` is always 1: links are followed. Returns
+// 0, or negative on failure.
 int ALIBCFileStat(const char* path, int flags, struct stat* status);
 
 // Creates an empty file, mode 0644 less the umask, or sets the times of what is there to now. A

@@ -10,6 +10,7 @@
 
 #include "model/collector_files.h"
 #include "model/xz.h"
+#include "platform/file.h"
 #include "quendel.h"
 #include "support/appliance.h"
 #include "support/calls.h"
@@ -105,7 +106,8 @@ ModelDisk ReadDisk(const std::vector<std::string>& folders) {
       }
       const std::string path = entry.path();
       struct stat status = {};
-      stat(path.c_str(), &status);
+      // The model knows a file by what the platform tells it by.
+      EXPECT_EQ(ALIBCFileStat(path.c_str(), 1, &status), 0) << path;
       ModelFile& file = disk[path];
       file.inode = status.st_ino;
       file.bytes = ReadFile(path);

@@ -14,6 +14,7 @@
 
 #include "model/checked_run.h"
 #include "model/collector_files.h"
+#include "model/loop_mount.h"
 #include "model/xz.h"
 #include "quendel.h"
 #include "support/appliance.h"
@@ -24,7 +25,6 @@ namespace {
 
 namespace fs = std::filesystem;
 
-// Every other history has its logs on the file system that they are collected to.
 constexpr const char* kFileSystems[] = {"/volume1", "/tmp"};
 
 int Environment(const char* name, int otherwise) {
@@ -40,12 +40,12 @@ enum class Kind {
 
 class History {
  public:
-  History(int number, Kind kind)
+  History(int number, Kind kind, const std::string& root)
       : kind_(kind),
         random_(static_cast<unsigned>(number)),
         steps_(20 + Below(20)),
-        logRoot_(std::string(kFileSystems[number % 2]) + "/logs"),
-        graveRoot_(std::string(kFileSystems[number % 2]) + "/graves") {
+        logRoot_(root + "/logs"),
+        graveRoot_(root + "/graves") {
     for (const std::string& folder :
          {logRoot_, graveRoot_, std::string(kConfFolder), std::string("/tmp/quendel")}) {
       fs::remove_all(folder);
@@ -354,12 +354,14 @@ class History {
   std::string trace_;
 };
 
-void PlayHistories(int first, int count, Kind kind) {
+// Without a root, every other history has its logs on the file system that they are collected to.
+void PlayHistories(int first, int count, Kind kind, const char* root = nullptr) {
   first = Environment("QUENDEL_HISTORY_SEED", first);
   count = Environment("QUENDEL_HISTORIES", count);
   printf("Histories %d to %d\n", first, first + count - 1);
   for (int number = first; number < first + count; ++number) {
-    const std::string failure = History(number, kind).Play();
+    const std::string failure =
+        History(number, kind, root != nullptr ? root : kFileSystems[number % 2]).Play();
     EXPECT_EQ(failure, "") << "QUENDEL_HISTORIES=1 QUENDEL_HISTORY_SEED=" << number;
   }
 }
@@ -376,6 +378,36 @@ TEST_P(LogHistoryTest, FollowsTheModel) {
 TEST_P(WellRotatedLogHistoryTest, FollowsTheModelAndLosesNoLine) {
   PlayHistories(100001 + 500 * GetParam(), 500, Kind::kWellRotated);
 }
+
+// On a file system that gives the number of a file that is gone to the next one.
+class ReusedNumbersHistoryTest : public testing::TestWithParam<const char*> {
+ protected:
+  void SetUp() override {
+    const std::string reason = MountFileSystem("ext4", kExt4);
+    if (!reason.empty()) {
+      GTEST_SKIP() << reason;
+    }
+    WriteFile("/usr/arvo/etc/device.conf", std::string("file_identity=") + GetParam() + "\n");
+  }
+
+  static constexpr char kExt4[] = "/volume1/ext4";
+};
+
+TEST_P(ReusedNumbersHistoryTest, FollowsTheModel) {
+  PlayHistories(200001, 100, Kind::kAnything, kExt4);
+}
+
+INSTANTIATE_TEST_SUITE_P(Identities, ReusedNumbersHistoryTest, testing::Values("inode", "birth"),
+                         [](const auto& identity) { return std::string(identity.param); });
+
+class BirthHistoryTest : public ReusedNumbersHistoryTest {};
+
+TEST_P(BirthHistoryTest, LosesNoLineOfALogThatIsRotatedWell) {
+  PlayHistories(300001, 100, Kind::kWellRotated, kExt4);
+}
+
+INSTANTIATE_TEST_SUITE_P(Identities, BirthHistoryTest, testing::Values("birth"),
+                         [](const auto& identity) { return std::string(identity.param); });
 
 INSTANTIATE_TEST_SUITE_P(FiveHundred, LogHistoryTest, testing::Range(0, 8));
 INSTANTIATE_TEST_SUITE_P(FiveHundred, WellRotatedLogHistoryTest, testing::Range(0, 3));

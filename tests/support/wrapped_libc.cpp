@@ -64,6 +64,8 @@ QUENDEL_WRAP(shmget, int, (key_t key, size_t size, int flags), key, size, flags)
 QUENDEL_WRAP(signal, sighandler_t, (int number, sighandler_t handler), number, handler);
 QUENDEL_WRAP(socket, int, (int domain, int type, int protocol), domain, type, protocol);
 QUENDEL_WRAP(stat, int, (const char* path, struct stat* status), path, status);
+QUENDEL_WRAP(statx, int, (int fd, const char* path, int flags, unsigned mask, struct statx* status),
+             Fd(fd), path, flags, mask, status);
 QUENDEL_WRAP(time, time_t, (time_t * result), result);
 QUENDEL_WRAP(unlink, int, (const char* path), path);
 QUENDEL_WRAP(utimensat, int, (int directory, const char* path, const timespec* times, int flags),

@@ -7,7 +7,8 @@
 namespace platform {
 
 // The text of quendel::kDeviceConfFile, read once for several keys. It is a flat key-value file
-// with the keys serial_number, account_email, account_field_a, account_field_b, timezone (a name
+// with the keys serial_number, account_email, account_field_a, account_field_b, file_identity
+// (inode or birth), timezone (a name
 // such as Europe/Berlin), and service_<name> (yes or no) for each service.
 class DeviceConf {
  public:

@@ -7,6 +7,7 @@
 #include <cerrno>
 
 #include "platform/standalone/error_code.h"
+#include "platform/standalone/file_identity.h"
 #include "platform/standalone/file_io.h"
 
 namespace platform {
@@ -46,15 +47,13 @@ int ALIBCFileUnlock(int lockId) {
   return lockId < 0 ? platform::FailForArgument() : 0;
 }
 
-int ALIBCFileStat(const char* path, int flags, struct stat* status) {
+int ALIBCFileStat(const char* path, int flags, struct stat* status) try {
   if (path == nullptr || status == nullptr || flags != platform::kFollowLinks) {
     return platform::FailForArgument();
   }
-  if (stat(path, status) == 0) {
-    return 0;
-  }
-  return platform::Fail(errno == ENOENT || errno == ENOTDIR ? platform::kErrorNotFound
-                                                            : platform::kErrorUnreadable);
+  return platform::StatWithIdentity(path, *status);
+} catch (...) {
+  return platform::FailForException();
 }
 
 int ALIBCFileTouch(const char* path) {
