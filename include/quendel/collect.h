@@ -26,6 +26,10 @@
 // same again. Neither a log or a collector that could not be read or run nor a performance file
 // that could not be written fails the run.
 //
+// "/tmp/quendel" and the run directory must be no links and belong to the effective user; a
+// directory of his that others may write to gets mode 0700. The children end with the process that
+// started them, however that ends, and stage nothing for another run.
+//
 // When `removeAfter` is not 0 the run directory and the archive are gone when the function returns,
 // whatever it returns. When it is 0 both stay, and are the caller's to remove.
 //

@@ -9,7 +9,8 @@
 // alone and stage the new values in "/tmp/quendel/quendel.log.update.conf" and
 // "/tmp/quendel/quendel.udc.update.conf". QUENDELUpdateCollectConf() commits them, once the
 // collected data has arrived. Data of a run that is given up in between is collected again by the
-// next one.
+// next one. The two files must be regular files of the effective user, in a directory that is his
+// alone and no link: nothing is staged in anything else, nor committed from it.
 //
 // In a message, "ret = %d" is the platform's last error.
 #ifndef QUENDEL_COLLECTORS_H_

@@ -25,9 +25,10 @@
 // QUENDEL_ACT_PROGRESS_NO_FILE; no other progress is reported. `actionId` is the number that the
 // server gave the request. With any progress but QUENDEL_ACT_PROGRESS_RUN nothing happens.
 //
-// Works below "/tmp/quendel", and compresses a dump beside itself, so its folder needs the room. Of
-// the directories "coredump" and "debugdat" the one used last is removed at the end;
-// "/tmp/quendel/debugdat.zip" stays. Not for two calls at a time on one device.
+// Works below "/tmp/quendel", which must be no link and belong to the effective user, like what is
+// used in it. Compresses a dump beside itself, so its directory needs the room. Of the directories
+// "coredump" and "debugdat" the one used last is removed at the end; "/tmp/quendel/debugdat.zip"
+// stays. Not for two calls at a time on one device.
 //
 // Returns 0 when the server accepted the files, or the report that there are none, and when there
 // was nothing to do; else -1.
@@ -47,7 +48,7 @@ QUENDEL_EXPORT int QUENDELSendUploadData(int actionId,
 // Prepares the local account `user` for the vendor's support staff: its home, "/run/quendelhome",
 // belongs to user ID 50001 and group ID 100, and `key`, one or more lines of an OpenSSH
 // authorized_keys file, opens it. The key is written as it stands, without a line end of its own;
-// an empty one is allowed. A symbolic link in place of the key file or its folder is refused, and
+// an empty one is allowed. A symbolic link in place of the key file or its directory is refused, and
 // so is a key file that is not a plain file or has a second name.
 //
 // Calling it again writes another key, but what an earlier holder left in the home stays; call

@@ -1,5 +1,6 @@
 // One collection run, from an empty directory to the delivered archive.
 #include <fcntl.h>
+#include <sys/prctl.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -8,12 +9,13 @@
 #include <csignal>
 #include <cstdio>
 #include <cstdlib>
-#include <cstring>
 #include <ctime>
+#include <iterator>
 
 #include "base/log.h"
+#include "base/ownership.h"
 #include "base/paths.h"
-#include "collect/collector_child.h"
+#include "collectors/staged_state.h"
 #include "platform/file.h"
 #include "platform/key_value.h"
 #include "platform/process.h"
@@ -30,24 +32,51 @@ constexpr char kLogUnit[] = "quendel_start_collect";
 constexpr int kDefaultWaitLimitSeconds = 600;
 constexpr mode_t kPrivateMode = 0700;
 
-// What each kind of child does, and what it logs when that fails.
-struct Collector {
-  const char* kind;
+// A kind of child: what it gathers, where, and what is logged of it. The run starts one of each, in
+// this order.
+struct Kind {
+  const char* name;  // in marker files and messages
   int (*collect)(const char* directory);
-  const char* failure;
+  const char* directory;    // below that of the run
+  const char* title;        // of the directory, in messages
+  const char* staged_file;  // where its new state waits for the commit
+  bool stages_first;        // before its results are written
+  const char* failed;
+  const char* not_started;
+  const char* not_committed;
 };
-constexpr Collector kCollectors[] = {
-    {"udc", QUENDELCollectUDC, "Error occured when child collecting UDC"},  // [sic] message
-    {"log", QUENDELCollectLog, "Error occured when child collecting log"},  // [sic] message
+constexpr Kind kKinds[] = {
+    {"udc", QUENDELCollectUDC, "/udc", "UDC", kUdcUpdateFile, true,
+     "Error occured when child collecting UDC",  // [sic] message
+     "Failed to collect UDC",                    // message
+     "Failed to update udc config"},             // message
+    {"log", QUENDELCollectLog, "/log", "log", kLogUpdateFile, false,
+     "Error occured when child collecting log",  // [sic] message
+     "Failed to collect logs",                   // message
+     "Failed to update log config"},             // message
+};
+
+// A child, from the moment when its directory has a name.
+struct Child {
+  const Kind* kind = nullptr;
+  char directory[64] = {};
+  char marker[64] = {};  // an empty file that exists while it is at work
+  int id = 0;            // until it is started
+  bool finished = false;
 };
 
 struct Run {
+  Run() {
+    for (size_t i = 0; i < std::size(kKinds); ++i) {
+      children[i].kind = &kKinds[i];
+    }
+  }
+
   time_t start = 0;
   char directory[64] = {};
   char perf[64] = {};
   char archive[64] = {};
-  CollectorChild udc = {"udc"};
-  CollectorChild log = {"log"};
+  Child children[std::size(kKinds)];
 };
 
 int ReadWaitLimit() {
@@ -67,18 +96,30 @@ void AppendTo(char (&path)[64], const char* directory, const char* suffix) {
   }
 }
 
+bool MakeIfMissing(const char* path) {
+  return mkdir(path, kPrivateMode) == 0 || errno == EEXIST;
+}
+
+void LogFailedDir(const char* path, const char* what) {
+  QUENDEL_LOG("Failed to create %s collect dir '%s'", what, path);
+}
+
+// Makes a directory, or takes what is there when it is ours.
 bool MakeDir(const char* path, const char* what) {
-  if (mkdir(path, kPrivateMode) != 0 && errno != EEXIST) {
-    QUENDEL_LOG("Failed to create %s collect dir '%s'", what, path);
+  if (!MakeIfMissing(path) || !IsOurs(path)) {
+    LogFailedDir(path, what);
     return false;
   }
   return true;
 }
 
 bool MakeWorkRoot() {
-  // Deliberate: a work root that cannot be made is reported like the user-defined collectors'
-  // directory.
-  return ALIBCFileCheckDir(kWorkRoot) == 1 || MakeDir(kWorkRoot, "UDC");
+  const bool isThere = ALIBCFileCheckDir(kWorkRoot) == 1 || MakeIfMissing(kWorkRoot);
+  if (!isThere || !IsOurDirectory(kWorkRoot)) {
+    LogFailedDir(kWorkRoot, "UDC");  // Deliberate: like the user-defined collectors' directory.
+    return false;
+  }
+  return true;
 }
 
 bool CanReachServer() {
@@ -101,44 +142,31 @@ bool TakeStartTime(Run& run) {
 void NamePaths(Run& run) {
   // Where the platform could not tell whether the name is free, making the directory decides.
   QUENDELGetDstDir(run.directory, sizeof run.directory, run.start);
-  AppendTo(run.udc.directory, run.directory, "/udc");
-  AppendTo(run.log.directory, run.directory, "/log");
+  for (Child& child : run.children) {
+    AppendTo(child.directory, run.directory, child.kind->directory);
+  }
   AppendTo(run.perf, run.directory, "/perf");
   AppendTo(run.archive, run.directory, ".tar.xz");
 }
 
 bool MakeRunDirs(const Run& run) {
-  const struct {
-    const char* path;
-    const char* what;
-  } directories[] = {
-      {run.directory, "quendel"},
-      {run.udc.directory, "UDC"},
-      {run.log.directory, "log"},
-      {run.perf, "perf"},
-  };
-  for (const auto& directory : directories) {
-    if (!MakeDir(directory.path, directory.what)) {
+  if (!MakeDir(run.directory, "quendel")) {
+    return false;
+  }
+  for (const Child& child : run.children) {
+    if (!MakeDir(child.directory, child.kind->title)) {
       return false;
     }
   }
-  return true;
+  return MakeDir(run.perf, "perf");
 }
 
 // What an older run reached and did not commit must not be taken for this run's, should a child die
 // before it gets to removing its own.
 void DropStagedState() {
-  remove(kLogUpdateFile);
-  remove(kUdcUpdateFile);
-}
-
-const Collector* FindCollector(const char* kind) {
-  for (const Collector& collector : kCollectors) {
-    if (strcmp(collector.kind, kind) == 0) {
-      return &collector;
-    }
+  for (const Kind& kind : kKinds) {
+    remove(kind.staged_file);
   }
-  return nullptr;
 }
 
 // Changes whether the calling thread blocks SIGTERM, and notes how it was when `before` is given.
@@ -158,35 +186,64 @@ void ReadNothing() {
   }
 }
 
-// The child's whole life. An exception here would carry the child up into its parent's callers, so
-// none may pass.
-[[noreturn]] void GatherAndExit(const Collector& collector, const char* directory) noexcept {
+// A child must not outlive its run: it would go on staging, into the files that the next run
+// commits. The run can have ended before this child asked for the signal.
+void EndWithTheRun(pid_t run) {
+  prctl(PR_SET_PDEATHSIG, SIGKILL);
+  if (getppid() != run) {
+    _exit(0);
+  }
+  StageForRunOf(run);
+}
+
+// The child's whole life. No exception may leave it: the caller's code would go on in two
+// processes.
+[[noreturn]] void GatherAndExit(const Child& child, pid_t run) noexcept {
+  EndWithTheRun(run);
   if (signal(SIGTERM, SIG_DFL) == SIG_ERR) {
-    QUENDEL_LOG("Failed to setup signal handler for %s collector: %m", collector.kind);
+    QUENDEL_LOG("Failed to setup signal handler for %s collector: %m", child.kind->name);
   }
   MaskSigterm(SIG_UNBLOCK, nullptr);
   ReadNothing();
-  if (collector.collect(directory) != 0) {
-    QUENDEL_LOG("%s", collector.failure);
+  if (child.kind->collect(child.directory) != 0) {
+    QUENDEL_LOG("%s", child.kind->failed);
   }
   _exit(0);  // Deliberate: a collector's failure never shows in the exit status.
 }
 
-void TouchMarker(CollectorChild& child) {
-  snprintf(child.marker, sizeof child.marker, "%s/%s.p.%d", kWorkRoot, child.kind, child.id);
-  if (ALIBCFileTouch(child.marker) != 0) {
+void TouchMarker(Child& child) {
+  snprintf(child.marker, sizeof child.marker, "%s/%s.p.%d", kWorkRoot, child.kind->name, child.id);
+  if (!IsOurFileOrNothing(child.marker) || ALIBCFileTouch(child.marker) != 0) {
     QUENDEL_LOG("Failed to touch file '%s'", child.marker);
   }
 }
 
-bool StartChildren(Run& run) {
-  if (StartCollectorChild(run.udc) != 0) {
-    QUENDEL_LOG("Failed to collect UDC");
+bool StartChild(Child& child) {
+  // SIGTERM waits until the child has its own action for it; otherwise a run that fails right after
+  // the fork could see the signal swallowed by a handler that the child inherited.
+  sigset_t before;
+  MaskSigterm(SIG_BLOCK, &before);
+  const pid_t run = getpid();
+  const int id = ALIBCProcForkEx(platform::kRunFlags);
+  if (id == 0) {
+    GatherAndExit(child, run);
+  }
+  pthread_sigmask(SIG_SETMASK, &before, nullptr);
+  if (id < 0) {
+    QUENDEL_LOG("Failed to fork a child to collect %s", child.kind->name);
     return false;
   }
-  if (StartCollectorChild(run.log) != 0) {
-    QUENDEL_LOG("Failed to collect logs");
-    return false;
+  child.id = id;
+  TouchMarker(child);
+  return true;
+}
+
+bool StartChildren(Run& run) {
+  for (Child& child : run.children) {
+    if (!StartChild(child)) {
+      QUENDEL_LOG("%s", child.kind->not_started);
+      return false;
+    }
   }
   return true;
 }
@@ -197,12 +254,31 @@ void WritePerformance(const Run& run, const Json::Value& perfSeries) {
   }
 }
 
-// The user-defined collectors' results are written after their state was staged. A child that was
-// killed in between has told nothing, and none of it may count as told.
-void DropUnwrittenResults(int status) {
-  if (WIFSIGNALED(status)) {
-    remove(kUdcUpdateFile);
+// A child that was killed may have staged its new state without having written the results. They
+// are gathered again then.
+void DropUnwrittenResults(const Child& child, int status) {
+  if (child.kind->stages_first && WIFSIGNALED(status)) {
+    remove(child.kind->staged_file);
   }
+}
+
+// Returns null for a process that is no child of the run.
+Child* FindChild(Run& run, pid_t id) {
+  for (Child& child : run.children) {
+    if (child.id == id) {
+      return &child;
+    }
+  }
+  return nullptr;
+}
+
+bool AllFinished(const Run& run) {
+  for (const Child& child : run.children) {
+    if (!child.finished) {
+      return false;
+    }
+  }
+  return true;
 }
 
 // The limit counts the seconds slept.
@@ -217,16 +293,16 @@ bool WaitForChildren(Run& run, int limitSeconds) {
     if (ended == 0) {
       ++secondsWaited;
       sleep(1);
-    } else if (ended == run.udc.id) {
-      run.udc.finished = true;
-      DropUnwrittenResults(status);
-    } else if (ended == run.log.id) {
-      run.log.finished = true;
-    } else {
+      continue;
+    }
+    Child* const child = FindChild(run, ended);
+    if (child == nullptr) {
       QUENDEL_LOG("Error happened when wait all children done");
       return false;
     }
-    if (run.udc.finished && run.log.finished) {
+    child->finished = true;
+    DropUnwrittenResults(*child, status);
+    if (AllFinished(run)) {
       return true;
     }
   }
@@ -242,15 +318,14 @@ bool Deliver(const Run& run) {
   return true;
 }
 
-// Counts what was gathered as collected. From here on the next run leaves it out.
+// Counts what was gathered as collected, the children's state in the reverse order of their start.
+// From here on the next run leaves it out.
 bool CommitState() {
-  if (QUENDELUpdateCollectConf(kLogUpdateFile) != 0) {
-    QUENDEL_LOG("Failed to update log config");
-    return false;
-  }
-  if (QUENDELUpdateCollectConf(kUdcUpdateFile) != 0) {
-    QUENDEL_LOG("Failed to update udc config");
-    return false;
+  for (size_t i = std::size(kKinds); i-- > 0;) {
+    if (QUENDELUpdateCollectConf(kKinds[i].staged_file) != 0) {
+      QUENDEL_LOG("%s", kKinds[i].not_committed);
+      return false;
+    }
   }
   return true;
 }
@@ -290,16 +365,16 @@ bool Collect(Run& run, int limitSeconds, bool send, const Json::Value& perfSerie
 //
 // Deliberate: the id is used as it is. That of a child that was never started is 0, which means the
 // process group of the caller: everything in it, this process included, gets SIGTERM.
-void EndChild(const CollectorChild& child) {
+void EndChild(const Child& child) {
   if (kill(child.id, 0) != 0) {
     return;
   }
   if (kill(child.id, SIGTERM) != 0) {
-    QUENDEL_LOG("Failed to kill a child for %s", child.kind);
+    QUENDEL_LOG("Failed to kill a child for %s", child.kind->name);
   }
   int status = 0;
   if (waitpid(child.id, &status, WUNTRACED) == -1) {
-    QUENDEL_LOG("Failed to wait a child for %s, err=%m", child.kind);
+    QUENDEL_LOG("Failed to wait a child for %s, err=%m", child.kind->name);
     return;
   }
   if (!WIFEXITED(status) && !WIFSIGNALED(status)) {
@@ -313,17 +388,20 @@ void RemoveFile(const char* path) {
   }
 }
 
+// A directory that was refused stays with its owner.
 void RemoveRunDir(const char* path) {
-  if (ALIBCFileCheckDir(path) == 1 && ALIBCopyRemoveDir(path) != 0) {
+  if (ALIBCFileCheckDir(path) == 1 && IsOurs(path) && ALIBCopyRemoveDir(path) != 0) {
     QUENDEL_LOG("Error happened when remove %s, errno:%d [%m]", path, errno);
   }
 }
 
 void CleanUp(const Run& run, bool removeAfter) {
-  EndChild(run.udc);
-  EndChild(run.log);
-  RemoveFile(run.udc.marker);
-  RemoveFile(run.log.marker);
+  for (const Child& child : run.children) {
+    EndChild(child);
+  }
+  for (const Child& child : run.children) {
+    RemoveFile(child.marker);
+  }
   if (removeAfter) {
     RemoveRunDir(run.directory);
     RemoveFile(run.archive);
@@ -331,31 +409,6 @@ void CleanUp(const Run& run, bool removeAfter) {
 }
 
 }  // namespace
-
-int StartCollectorChild(CollectorChild& child) {
-  const Collector* collector = FindCollector(child.kind);
-  if (collector == nullptr) {
-    QUENDEL_LOG("Bad parameter of data: %s", child.kind);
-    return -1;
-  }
-  // SIGTERM waits until the child has its own action for it; otherwise a run that fails right after
-  // the fork could see the signal swallowed by a handler that the child inherited.
-  sigset_t before;
-  MaskSigterm(SIG_BLOCK, &before);
-  const int id = ALIBCProcForkEx(platform::kRunFlags);
-  if (id == 0) {
-    GatherAndExit(*collector, child.directory);
-  }
-  pthread_sigmask(SIG_SETMASK, &before, nullptr);
-  if (id < 0) {
-    QUENDEL_LOG("Failed to fork a child to collect %s", child.kind);
-    return -1;
-  }
-  child.id = id;
-  TouchMarker(child);
-  return 0;
-}
-
 }  // namespace quendel
 
 using namespace quendel;

@@ -15,8 +15,8 @@
 #include "base/log.h"
 #include "base/paths.h"
 #include "collectors/line_copy.h"
+#include "collectors/staged_state.h"
 #include "platform/file.h"
-#include "platform/key_value.h"
 #include "platform/owned.h"
 #include "platform/process.h"
 #include "quendel/collectors.h"
@@ -46,13 +46,18 @@ struct LogTask {
   const char* dst_dir;
   const QUENDELLogConf_t* record;
   OwnedHash* staged;  // its new state
+  Path output;        // the file that what is collected goes to
 };
 
 enum class DiffResult { kDone, kCannotContinue, kError };
 
-// What became of a live log. Of a changed inode's whole copy, and of nothing else, the caller
-// reports a section that could not be added as the log's own failure too.
-enum class LiveResult { kFailed, kNothingNew, kContinued, kReplaced };
+// What became of a live log.
+enum class LiveResult {
+  kFailed,
+  kNothingNew,
+  kContinued,  // the file of last time: its new lines, or all of it where it was rewritten
+  kReplaced    // another file under the log's name, collected whole
+};
 
 // Builds "<log>.<number>.xz". Returns false when the name does not fit: cut, it would name another
 // file.
@@ -120,7 +125,7 @@ DiffResult FindLastCollected(const LogTask& task, const char* source, int file, 
 }
 
 // Copies the lines that follow the last one collected, as far as `limit`.
-DiffResult CopyDiff(const LogTask& task, const char* source, const char* output, int64_t limit) {
+DiffResult CopyDiff(const LogTask& task, const char* source, int64_t limit) {
   struct stat status = {};
   const OwnedFd in = OpenRegularFile(source, status);
   if (!in) {
@@ -133,9 +138,9 @@ DiffResult CopyDiff(const LogTask& task, const char* source, const char* output,
     return found;
   }
   // Deliberate: what the archive step put here goes. Only a whole copy adds to an output.
-  OwnedFd out(open(output, O_RDWR | O_CREAT | O_TRUNC | O_CLOEXEC, 0666));
+  OwnedFd out(open(task.output, O_RDWR | O_CREAT | O_TRUNC | O_CLOEXEC, 0666));
   if (!out) {
-    QUENDEL_LOG("Failed to open file '%s'", output);
+    QUENDEL_LOG("Failed to open file '%s'", task.output);
     return DiffResult::kError;
   }
   const int64_t start = last.end;
@@ -217,12 +222,14 @@ bool CopyWholeLog(const char* source, const char* output, int64_t& base) {
   return true;
 }
 
-bool CopyWholeAndStage(const LogTask& task, const char* source, const char* output, ino_t inode) {
+bool CopyWholeAndStage(const LogTask& task, ino_t inode) {
+  const char* const source = task.record->path;
+  const char* const output = task.output;
   int64_t base = 0;
   if (!CopyWholeLog(source, output, base)) {
     return false;
   }
-  Path inodeText = {};
+  char inodeText[64] = {};
   snprintf(inodeText, sizeof inodeText, "%u", static_cast<unsigned>(inode));
   if (!StageValue(task, "inode", inodeText)) {
     return false;
@@ -291,9 +298,7 @@ DiffResult DiffArchiveCopy(const LogTask& task, int number, const char* copy, co
     QUENDEL_LOG("Failed to stat file '%s'", plain);
     return DiffResult::kDone;
   }
-  Path output = {};
-  snprintf(output, sizeof output, "%s/%s", task.dst_dir, task.record->name);
-  const DiffResult result = CopyDiff(task, plain, output, status.st_size);
+  const DiffResult result = CopyDiff(task, plain, status.st_size);
   if (result == DiffResult::kError) {
     QUENDEL_LOG("Failed to collect diff log '%s'", plain);
   }
@@ -363,9 +368,9 @@ bool CollectArchives(const LogTask& task) try {
   return false;
 }
 
-bool CollectWhole(const LogTask& task, const char* output, ino_t inode) {
+bool CollectWhole(const LogTask& task, ino_t inode) {
   const char* const log = task.record->path;
-  if (!CopyWholeAndStage(task, log, output, inode)) {
+  if (!CopyWholeAndStage(task, inode)) {
     QUENDEL_LOG("Failed to collect whole log '%s'", log);
     return false;
   }
@@ -373,12 +378,12 @@ bool CollectWhole(const LogTask& task, const char* output, ino_t inode) {
 }
 
 // Collects the same file as last time.
-LiveResult ContinueLiveLog(const LogTask& task, const char* output, const struct stat& status) {
+LiveResult ContinueLiveLog(const LogTask& task, const struct stat& status) {
   const char* const log = task.record->path;
   if (status.st_size == task.record->total_byte) {
     return LiveResult::kNothingNew;
   }
-  switch (CopyDiff(task, log, output, status.st_size)) {
+  switch (CopyDiff(task, log, status.st_size)) {
     case DiffResult::kDone:
       return LiveResult::kContinued;
     case DiffResult::kError:
@@ -388,7 +393,7 @@ LiveResult ContinueLiveLog(const LogTask& task, const char* output, const struct
       break;
   }
   QUENDEL_LOG("Failed to collect diff log '%s' because of hash not match", log);
-  return CollectWhole(task, output, status.st_ino) ? LiveResult::kContinued : LiveResult::kFailed;
+  return CollectWhole(task, status.st_ino) ? LiveResult::kContinued : LiveResult::kFailed;
 }
 
 LiveResult CollectLiveLog(const LogTask& task) {
@@ -402,13 +407,11 @@ LiveResult CollectLiveLog(const LogTask& task) {
     QUENDEL_LOG("Failed to stat file '%s'", log);
     return LiveResult::kFailed;
   }
-  Path output = {};
-  snprintf(output, sizeof output, "%s/%s", task.dst_dir, task.record->name);
   // Deliberate: the recorded inode has 32 bits. A file with a wider one never matches it.
   if (static_cast<ino_t>(task.record->inode) == status.st_ino) {
-    return ContinueLiveLog(task, output, status);
+    return ContinueLiveLog(task, status);
   }
-  return CollectWhole(task, output, status.st_ino) ? LiveResult::kReplaced : LiveResult::kFailed;
+  return CollectWhole(task, status.st_ino) ? LiveResult::kReplaced : LiveResult::kFailed;
 }
 
 // Collects one log and stages its new state. Returns false when the log counts as failed.
@@ -427,7 +430,8 @@ bool CollectLog(const char* conf, const char* dstDir) {
     QUENDEL_LOG("Failed to get config of '%s'", conf);
     return false;
   }
-  const LogTask task = {conf, dstDir, record.get(), &staged};
+  LogTask task = {conf, dstDir, record.get(), &staged, {}};
+  snprintf(task.output, sizeof task.output, "%s/%s", dstDir, record->name);
   if (!CollectArchives(task)) {
     QUENDEL_LOG("Failed to collect tared log of '%s'", conf);
     return false;
@@ -436,7 +440,7 @@ bool CollectLog(const char* conf, const char* dstDir) {
   if (live == LiveResult::kFailed || live == LiveResult::kNothingNew) {
     return live == LiveResult::kNothingNew;
   }
-  if (ALIBCFileAddSection(kLogUpdateFile, conf, staged.get(), 0) < 1) {
+  if (!AppendStagedState(kLogUpdateFile, conf, staged.get())) {
     QUENDEL_LOG("Failed to add new section to '%s'", kLogUpdateFile);
     // Deliberate: only a log whose inode had changed counts as failed because of it.
     return live != LiveResult::kReplaced;
@@ -459,7 +463,9 @@ int QUENDELCollectLog(const char* dstDir) try {
     QUENDEL_LOG("Failed to allocate memory for list");
     return -1;
   }
-  RemoveIfExists(kLogUpdateFile);
+  if (ALIBCFileExist(kLogUpdateFile) != 0 && !RemoveStagedState(kLogUpdateFile)) {
+    QUENDEL_LOG("Failed to remove %s [errno=%d]", kLogUpdateFile, errno);
+  }
   if (ALIBCFileEnumDir(kCollectorConfDir, "quendel.log.", names.slot(),
                        platform::kEnumRegularFiles) < 0) {
     QUENDEL_LOG("Failed to enum dir '%s'", kCollectorConfDir);

@@ -10,8 +10,8 @@
 #include "base/json_text.h"
 #include "base/log.h"
 #include "base/paths.h"
+#include "collectors/staged_state.h"
 #include "platform/file.h"
-#include "platform/key_value.h"
 #include "platform/owned.h"
 #include "platform/process.h"
 #include "quendel/collectors.h"
@@ -84,7 +84,7 @@ bool StageHash(const char* conf, const char* hash, OwnedHash& staged) {
     QUENDEL_LOG("Failed to set hash of conf '%s' to '%s'", conf, hash);
     return false;
   }
-  if (ALIBCFileAddSection(kUdcUpdateFile, conf, staged.get(), 0) < 1) {
+  if (!AppendStagedState(kUdcUpdateFile, conf, staged.get())) {
     QUENDEL_LOG("Failed to add new section to '%s'", kUdcUpdateFile);
     return false;
   }
@@ -194,7 +194,7 @@ int QUENDELCollectUDC(const char* dstDir) try {
     QUENDEL_LOG("Failed to allocate memory for UDC hash");
     return -1;
   }
-  if (ALIBCFileExist(kUdcUpdateFile) != 0 && remove(kUdcUpdateFile) != 0) {
+  if (ALIBCFileExist(kUdcUpdateFile) != 0 && !RemoveStagedState(kUdcUpdateFile)) {
     QUENDEL_LOG("Failed to remove %s [errno=%d]", kUdcUpdateFile, errno);
   }
   if (ALIBCFileEnumDir(kCollectorConfDir, "quendel.udc.", names.slot(),
@@ -204,12 +204,12 @@ int QUENDELCollectUDC(const char* dstDir) try {
   }
   if (!CollectAll(dstDir, names, staged)) {
     // What the results do not tell must not count as told.
-    remove(kUdcUpdateFile);
+    RemoveStagedState(kUdcUpdateFile);
     return -1;
   }
   return 0;
 } catch (...) {
   QUENDEL_LOG("Failed to allocate memory for list");
-  remove(kUdcUpdateFile);
+  RemoveStagedState(kUdcUpdateFile);
   return -1;
 }

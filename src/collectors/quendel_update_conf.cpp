@@ -1,5 +1,6 @@
 // Commits the staged state of the collectors into their configuration files.
 #include "base/log.h"
+#include "collectors/staged_state.h"
 #include "platform/error.h"
 #include "platform/file.h"
 #include "platform/key_value.h"
@@ -70,7 +71,7 @@ int QUENDELUpdateCollectConf(const char* path) {
     QUENDEL_LOG("Failed to allocate memory for hash");
     return -1;
   }
-  if (ALIBCFileEnumSection(path, sections.slot()) < 0) {
+  if (!MayBeCommitted(path) || ALIBCFileEnumSection(path, sections.slot()) < 0) {
     QUENDEL_LOG("Failed to enum section of '%s'", path);
     return -1;
   }

@@ -25,9 +25,9 @@ struct Session {
   std::string account;
 };
 
-// Tells whether a progress value closes a session: done (0) or failed (-1).
+// A session ends as done or as failed.
 bool IsClosing(QuendelActionProgress_t progress) {
-  return static_cast<unsigned int>(progress) + 1U <= 1U;
+  return progress == QUENDEL_ACT_PROGRESS_DONE || progress == QUENDEL_ACT_PROGRESS_FAILED;
 }
 
 // Without memory for the name of an account, the account must not pass for one that is not there.

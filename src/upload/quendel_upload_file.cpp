@@ -1,6 +1,8 @@
 // The upload action: the server asks for crash dumps and debug data, and gets them.
 #include <regex.h>
+#include <sys/stat.h>
 
+#include <cerrno>
 #include <cstring>
 #include <ctime>
 #include <string>
@@ -8,6 +10,7 @@
 
 #include "base/json_text.h"
 #include "base/log.h"
+#include "base/ownership.h"
 #include "base/paths.h"
 #include "platform/file.h"
 #include "platform/process.h"
@@ -27,6 +30,7 @@ constexpr Json::ArrayIndex kMaxFiles = 5;
 // The name of a prepared file, its NUL included.
 constexpr size_t kMaxPathBytes = 1024;
 
+constexpr unsigned int kPrivateMode = 0700;
 constexpr char kCollectorTool[] = "/usr/arvo/bin/arvomsg_collector2";
 
 bool MatchesDumpPattern(const char* path) {
@@ -60,8 +64,22 @@ bool PathsAreValid(const Json::Value& files) try {
   return false;
 }
 
+// Where a request's files are prepared.
+struct Preparation {
+  const char* temp_dir = "";  // is removed at the end; of two kinds of file, the last one's
+  std::string file;           // the one that was prepared last
+};
+
+// What is not there is no danger: the next step finds out.
+bool IsOursOrNothing(const char* directory) {
+  return IsOurDirectory(directory) || errno == ENOENT;
+}
+
 bool MakeDirectory(const char* path) {
-  if (ARVOFSMkdirP(path, 0, 1, -1, -1, 0700) < 0) {
+  // Before the platform could make it, who may follow a link that somebody puts there meanwhile.
+  mkdir(kWorkRoot, kPrivateMode);
+  if (!IsOursOrNothing(kWorkRoot) || ARVOFSMkdirP(path, 0, 1, -1, -1, kPrivateMode) < 0 ||
+      !IsOursOrNothing(kWorkRoot) || !IsOursOrNothing(path)) {
     QUENDEL_LOG("Fail to ARVOFSMkdirP for '%s'", path);
     return false;
   }
@@ -80,11 +98,11 @@ bool MoveCompressedDump(const std::string& compressed) {
   return true;
 }
 
-bool PrepareDump(const std::string& dump, const char*& tempDir, std::string& prepared) {
+bool PrepareDump(const std::string& dump, Preparation& preparation) {
   if (!MakeDirectory(kDumpDir)) {
     return false;
   }
-  tempDir = kDumpDir;
+  preparation.temp_dir = kDumpDir;
   const std::string compressed = dump + ".xz";
   if (compressed.size() >= kMaxPathBytes) {
     return false;  // a name cut to its buffer could be that of the dump, which would then be moved
@@ -96,37 +114,38 @@ bool PrepareDump(const std::string& dump, const char*& tempDir, std::string& pre
   if (!MoveCompressedDump(compressed)) {
     return false;
   }
-  prepared = std::string(kDumpDir) + "/" + basename(compressed.c_str());
+  preparation.file = std::string(kDumpDir) + "/" + basename(compressed.c_str());
   return true;
 }
 
-bool PrepareDebugArchive(const char*& tempDir, std::string& prepared) {
+bool PrepareDebugArchive(Preparation& preparation) {
   if (!MakeDirectory(kDebugDir)) {
     return false;
   }
-  tempDir = kDebugDir;
+  preparation.temp_dir = kDebugDir;
   if (ALIBCExec(kCollectorTool, kDebugDir, nullptr, nullptr, nullptr) != 0) {
     QUENDEL_LOG("Fail to do log collector %s %s", kCollectorTool, kDebugDir);
     return false;
   }
-  prepared = std::string(kDebugDir) + ".zip";
   // Deliberate: this archive lies beside the temporary directory and stays when that is removed.
-  if (ALIBCExecl("/usr/bin/zip", platform::kRunFlags, "-q", "-9", "-UN=UTF8", "-E", "-yf", "-r",
-                 prepared.c_str(), kDebugDir, nullptr) < 0) {
-    QUENDEL_LOG("Fail to zip attachment %s", prepared.c_str());
+  preparation.file = std::string(kDebugDir) + ".zip";
+  const char* const archive = preparation.file.c_str();
+  if (!IsOurFileOrNothing(archive) ||
+      ALIBCExecl("/usr/bin/zip", platform::kRunFlags, "-q", "-9", "-UN=UTF8", "-E", "-yf", "-r",
+                 archive, kDebugDir, nullptr) < 0) {
+    QUENDEL_LOG("Fail to zip attachment %s", archive);
     return false;
   }
   return true;
 }
 
 // Prepares one file by its type. Returns false when the file is given up.
-bool PrepareFile(const std::string& path, const std::string& type, const char*& tempDir,
-                 std::string& prepared) try {
+bool PrepareFile(const std::string& path, const std::string& type, Preparation& preparation) try {
   if (type == kDumpType) {
-    return PrepareDump(path, tempDir, prepared);
+    return PrepareDump(path, preparation);
   }
   if (type == kDebugType) {
-    return PrepareDebugArchive(tempDir, prepared);
+    return PrepareDebugArchive(preparation);
   }
   QUENDEL_LOG("Get unknown upload file type: \"%s\".", type.c_str());
   return false;
@@ -134,7 +153,8 @@ bool PrepareFile(const std::string& path, const std::string& type, const char*& 
   return false;
 }
 
-std::vector<QUENDELSendDataParam_t> PrepareFiles(const Json::Value& files, const char*& tempDir) {
+std::vector<QUENDELSendDataParam_t> PrepareFiles(const Json::Value& files,
+                                                 Preparation& preparation) {
   std::vector<QUENDELSendDataParam_t> prepared;
   for (const Json::Value& file : files) {
     // Up to the first NUL, as the pattern saw it: the tools must be given no other text.
@@ -143,10 +163,11 @@ std::vector<QUENDELSendDataParam_t> PrepareFiles(const Json::Value& files, const
     item.fileuuid = JsonText(file, "file_uuid");
     item.type = JsonText(file, "file_type");
     item.timestamp = static_cast<uint64_t>(time(nullptr));
-    if (!PrepareFile(path, item.type, tempDir, item.path)) {
+    if (!PrepareFile(path, item.type, preparation)) {
       QUENDEL_LOG("Prepare uploaded file failed [%s]:[%s]", item.type.c_str(), path.c_str());
       continue;
     }
+    item.path = preparation.file;
     prepared.push_back(item);
   }
   return prepared;
@@ -159,10 +180,9 @@ bool ReportNoFile(int actionId) try {
   return false;
 }
 
-// Does everything the request asks for. Leaves in tempDir the directory that is to be removed, of
-// which there is only one.
+// Does everything the request asks for.
 // Deliberate: of two kinds of file, the kind prepared first leaves its own directory.
-int AnswerRequest(int actionId, const Json::Value& files, const char*& tempDir) try {
+int AnswerRequest(int actionId, const Json::Value& files, Preparation& preparation) try {
   if (!PathsAreValid(files)) {
     QUENDEL_LOG("Validate filepath failed");
     return -1;
@@ -171,7 +191,7 @@ int AnswerRequest(int actionId, const Json::Value& files, const char*& tempDir) 
     QUENDEL_LOG("Upload files exceed the max limit");
     return -1;
   }
-  const std::vector<QUENDELSendDataParam_t> prepared = PrepareFiles(files, tempDir);
+  const std::vector<QUENDELSendDataParam_t> prepared = PrepareFiles(files, preparation);
   if (prepared.empty()) {
     if (!ReportNoFile(actionId)) {
       QUENDEL_LOG("Failed to update progress to server");
@@ -207,8 +227,8 @@ int QUENDELUploadFile(int actionId, QuendelActionProgress_t progress, const Json
   if (progress != QUENDEL_ACT_PROGRESS_RUN) {
     return 0;
   }
-  const char* tempDir = "";
-  const int result = AnswerRequest(actionId, files, tempDir);
-  RemoveTempDir(tempDir);
+  Preparation preparation;
+  const int result = AnswerRequest(actionId, files, preparation);
+  RemoveTempDir(preparation.temp_dir);
   return result;
 }

@@ -15,7 +15,6 @@
 #include "base/paths.h"
 #include "collect/archive_entries.h"
 #include "collect/collection.h"
-#include "collect/collector_child.h"
 #include "quendel.h"
 #include "support/appliance.h"
 #include "support/calls.h"
@@ -834,10 +833,11 @@ TEST(StartCollectTest, FailsWhenADirectoryCannotBeMade) {
   }
 }
 
-TEST(StartCollectTest, TakesAFileInTheWorkRootsPlaceForADirectory) {
+TEST(StartCollectTest, RefusesAFileInTheWorkRootsPlace) {
   WriteFile(quendel::kWorkRoot, "");
-  EXPECT_EQ(Collect(), 0);
-  EXPECT_THAT(Log(), Contains(Logged(kUnit, StartsWith("Failed to touch file"))).Times(2));
+  EXPECT_EQ(RunIgnoringSigterm([] { return Collect(); }).result, -1);
+  EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Failed to create UDC collect dir '/tmp/quendel'"),
+                                 NothingToWaitFor("udc"), NothingToWaitFor("log")));
 }
 
 TEST(StartCollectTest, FailsWithoutAUdcChild) {
@@ -1054,15 +1054,4 @@ TEST(StartCollectTest, LosesNothingToAFullDisk) {
   EXPECT_GT(partial, 0);   // the log did not, and the archive of the rest did
   EXPECT_EQ(Collect(), 0);
   EXPECT_NE(CollectorConf().at(log), before.at(log));
-}
-
-TEST(StartCollectorChildTest, KnowsTwoKindsOfChildren) {
-  for (const char* kind : {"", "perf", "UDC", "logs"}) {
-    ClearLog();
-    quendel::CollectorChild child = {kind};
-    EXPECT_EQ(quendel::StartCollectorChild(child), -1);
-    EXPECT_EQ(child.id, 0);
-    EXPECT_THAT(Log(), ElementsAre(Logged(kUnit, "Bad parameter of data: " + std::string(kind))));
-  }
-  EXPECT_EQ(Calls("ALIBCProcForkEx"), 0);
 }
