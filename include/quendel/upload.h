@@ -48,8 +48,8 @@ QUENDEL_EXPORT int QUENDELSendUploadData(int actionId,
 // Prepares the local account `user` for the vendor's support staff: its home, "/run/quendelhome",
 // belongs to user ID 50001 and group ID 100, and `key`, one or more lines of an OpenSSH
 // authorized_keys file, opens it. The key is written as it stands, without a line end of its own;
-// an empty one is allowed. A symbolic link in place of the key file or its directory is refused, and
-// so is a key file that is not a plain file or has a second name.
+// an empty one is allowed. A symbolic link in place of the key file or its directory is refused,
+// and so is a key file that is not a plain file or has a second name.
 //
 // Calling it again writes another key, but what an earlier holder left in the home stays; call
 // QUENDELSupportAccountUserDelete() first. Needs root.
