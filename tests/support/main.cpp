@@ -6,7 +6,7 @@
 int main(int argc, char** argv) {
   testing::InitGoogleMock(&argc, argv);
   if (!GTEST_FLAG_GET(list_tests)) {
-    quendel::test::EndUnlessOnAppliance("script/test -- -R SUITE");
+    quendel::test::EndUnlessOnAppliance("script/test SUITE");
   }
   return RUN_ALL_TESTS();
 }
