@@ -1,8 +1,11 @@
 # Writes down for CTest which tests a program holds. The build runs this when it has made the program:
 #
-#   cmake -D PROGRAM=FILE -D COMMAND=LIST -D FOLDER=FOLDER -D LIST=FILE -P list_tests.cmake
+#   cmake -D PROGRAM=FILE -D COMMAND=LIST -D FOLDER=FOLDER -D LIST=FILE -D SLOW=LIST
+#     -P list_tests.cmake
 #
-# PROGRAM tells its tests, COMMAND runs them on an appliance, in FOLDER; LIST is the file to write.
+# PROGRAM tells its tests, COMMAND runs them on an appliance, in FOLDER; LIST is the file to write. SLOW
+# names those that take long.
+cmake_minimum_required(VERSION 3.25)
 execute_process(COMMAND ${PROGRAM} --gtest_list_tests OUTPUT_VARIABLE lines COMMAND_ERROR_IS_FATAL ANY)
 
 # A comment tells the value of a parameter, which may hold anything.
@@ -22,5 +25,12 @@ foreach(line ${lines})
   string(APPEND tests
     "add_test(${test} \${command} --gtest_filter=${test} --gtest_also_run_disabled_tests)\n"
     "set_tests_properties(${test} PROPERTIES \${properties})\n")
+  if(test IN_LIST SLOW)
+    list(REMOVE_ITEM SLOW ${test})
+    string(APPEND tests "set_tests_properties(${test} PROPERTIES LABELS slow COST 100)\n")
+  endif()
 endforeach()
+if(SLOW)
+  message(FATAL_ERROR "${PROGRAM} does not hold ${SLOW}")
+endif()
 file(WRITE ${LIST} "${tests}")

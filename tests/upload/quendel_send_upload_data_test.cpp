@@ -1,6 +1,7 @@
 // The delivery of requested files.
 #include <gmock/gmock.h>
 
+#include <algorithm>
 #include <climits>
 #include <cstdint>
 
@@ -183,7 +184,9 @@ TEST(SendUploadDataTest, GoesByWhatEachHostileReplySays) {
   for (const HostileReply& reply : HostileReplies()) {
     SCOPED_TRACE(reply.name);
     ClearLog();
-    Answer(reply.answer);
+    ScriptedAnswer answer = reply.answer;
+    answer.fill = std::min<size_t>(answer.fill, 1'000'000);  // the file post's test takes the whole
+    Answer(answer);
     EXPECT_EQ(QUENDELSendUploadData(17, {}), reply.success ? 0 : -1);
     if (reply.success) {
       EXPECT_THAT(Log(), IsEmpty());
