@@ -9,6 +9,7 @@
 #include <csignal>
 #include <cstdio>
 #include <cstdlib>
+#include <cstring>
 #include <ctime>
 #include <iterator>
 
@@ -218,7 +219,16 @@ void TouchMarker(Child& child) {
   }
 }
 
+// Only these two are known to whoever reads the markers.
+bool IsKnown(const Kind& kind) {
+  return strcmp(kind.name, "log") == 0 || strcmp(kind.name, "udc") == 0;
+}
+
 bool StartChild(Child& child) {
+  if (!IsKnown(*child.kind)) {
+    QUENDEL_LOG("Bad parameter of data: %s", child.kind->name);
+    return false;
+  }
   // SIGTERM waits until the child has its own action for it; otherwise a run that fails right after
   // the fork could see the signal swallowed by a handler that the child inherited.
   sigset_t before;
