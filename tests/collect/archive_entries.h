@@ -1,6 +1,6 @@
 // Reads an archive with a reader that is not the tar that made it.
-#ifndef COLLECT_ARCHIVE_ENTRIES_H_
-#define COLLECT_ARCHIVE_ENTRIES_H_
+#ifndef TESTS_COLLECT_ARCHIVE_ENTRIES_H_
+#define TESTS_COLLECT_ARCHIVE_ENTRIES_H_
 
 #include <map>
 #include <string>
@@ -13,4 +13,4 @@ std::map<std::string, std::string> ArchiveEntries(const std::string& path);
 
 }  // namespace quendel::test
 
-#endif  // COLLECT_ARCHIVE_ENTRIES_H_
+#endif  // TESTS_COLLECT_ARCHIVE_ENTRIES_H_

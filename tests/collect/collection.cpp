@@ -11,6 +11,7 @@
 
 #include "support/appliance.h"
 #include "support/calls.h"
+#include "support/device.h"
 #include "support/require.h"
 
 namespace quendel::test {
@@ -21,13 +22,8 @@ void StopTheClock() {
 
 void InstallCollectors(const std::string& raid) {
   WriteFile("/volume1/messages", "first\nsecond\n");
-  WriteFile("/usr/arvo/etc/quendel/quendel.log.messages",
-            "name=messages\npath=/volume1/messages\nlast_hash=\"\"\ntar_log_inode=\"\"\n"
-            "last_byte=\"\"\ntotal_byte=\"\"\ninode=\"\"\n");
-  WriteFile("/volume1/raid", "#!/bin/sh\n" + raid + "\n");
-  Require(chmod("/volume1/raid", 0700) == 0, "cannot make a program");
-  WriteFile("/usr/arvo/etc/quendel/quendel.udc.raid",
-            "name=raid\npath=/volume1/raid\nlast_hash=\"\"\n");
+  InstallLog("messages", "/volume1/messages");
+  InstallUdc("raid", raid);
 }
 
 std::map<std::string, std::string> CollectorConf() {

@@ -1,7 +1,7 @@
 // What the tests of a collection run share: a device with something to collect, collectors that do
 // as they are told, and a process group that a run can signal.
-#ifndef COLLECT_COLLECTION_H_
-#define COLLECT_COLLECTION_H_
+#ifndef TESTS_COLLECT_COLLECTION_H_
+#define TESTS_COLLECT_COLLECTION_H_
 
 #include <json/value.h>
 #include <sys/types.h>
@@ -64,4 +64,4 @@ Ending InAGroupOfItsOwn(const std::function<int()>& work);
 
 }  // namespace quendel::test
 
-#endif  // COLLECT_COLLECTION_H_
+#endif  // TESTS_COLLECT_COLLECTION_H_

@@ -18,6 +18,7 @@
 #include "quendel.h"
 #include "support/appliance.h"
 #include "support/calls.h"
+#include "support/device.h"
 #include "support/json.h"
 #include "support/log.h"
 
@@ -74,12 +75,6 @@ std::vector<std::string> LeftInWorkRoot() {
   }
   std::sort(left.begin(), left.end());
   return left;
-}
-
-mode_t ModeOf(const char* path) {
-  struct stat status = {};
-  EXPECT_EQ(stat(path, &status), 0) << path;
-  return status.st_mode;
 }
 
 // Runs what fails before both children were started, in a process that lives on after SIGTERM.
@@ -181,7 +176,7 @@ TEST(StartCollectTest, MakesItsDirectoriesForTheOwnerOnly) {
   umask(0);
   ASSERT_EQ(Collect(), 0);
   for (const char* path : {"", "/udc", "/log", "/perf"}) {
-    EXPECT_EQ(ModeOf((kRunDir + std::string(path)).c_str()), S_IFDIR | 0700U) << path;
+    EXPECT_EQ(ModeOf(kRunDir + std::string(path)), S_IFDIR | 0700U) << path;
   }
   EXPECT_EQ(ModeOf(quendel::kWorkRoot), S_IFDIR | 0700U);
 }

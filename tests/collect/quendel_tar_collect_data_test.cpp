@@ -11,6 +11,7 @@
 #include "quendel.h"
 #include "support/appliance.h"
 #include "support/calls.h"
+#include "support/device.h"
 #include "support/log.h"
 
 using namespace quendel::test;
@@ -29,12 +30,6 @@ std::vector<std::string> RunFor(const char* dir) {
   On("ALIBCExecl").Nth(1).Return(0);
   EXPECT_EQ(QUENDELTarCollectData(dir, kArchive), 0);
   return Recorded();
-}
-
-mode_t ModeOf(const char* path) {
-  struct stat status = {};
-  EXPECT_EQ(lstat(path, &status), 0) << path;
-  return status.st_mode;
 }
 
 void ExpectFailure(const std::string& dir, const char* archive = kArchive) {

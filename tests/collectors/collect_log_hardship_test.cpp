@@ -11,11 +11,11 @@
 #include <fstream>
 
 #include "model/collector_files.h"
-#include "model/xz.h"
 #include "quendel.h"
 #include "support/appliance.h"
 #include "support/calls.h"
 #include "support/log.h"
+#include "support/xz.h"
 
 using namespace quendel::test;
 using testing::Contains;

@@ -8,10 +8,10 @@
 #include <utility>
 
 #include "model/collector_files.h"
-#include "model/xz.h"
 #include "quendel.h"
 #include "support/appliance.h"
 #include "support/calls.h"
+#include "support/xz.h"
 
 using namespace quendel::test;
 
@@ -53,12 +53,6 @@ void InstallCollected(const std::string& text) {
   InstallLog("m", kLog);
   WriteFile(kLog, text);
   Deliver();
-}
-
-uint64_t InodeOf(const std::string& path) {
-  struct stat status = {};
-  EXPECT_EQ(stat(path.c_str(), &status), 0);
-  return status.st_ino;
 }
 
 // Writes over the log without making a new file.

@@ -12,6 +12,7 @@
 #include "quendel.h"
 #include "support/appliance.h"
 #include "support/calls.h"
+#include "support/device.h"
 
 using namespace quendel;
 using namespace quendel::test;
@@ -23,12 +24,6 @@ constexpr char kSink[] = "/tmp/sink";
 
 // Around the size of a block, which is 65536 bytes.
 constexpr size_t kLengths[] = {0, 1, 2, 65534, 65535, 65536, 65537, 131071, 131072, 131073, 200000};
-
-std::string Md5(const std::string& text) {
-  char digits[33];
-  QUENDELMD5String(text, digits);
-  return digits;
-}
 
 std::string LineOf(size_t length) {
   std::string line;
@@ -49,7 +44,7 @@ OwnedFd Sink() {
 }
 
 void ExpectLine(const LineMark& line, const std::string& text, size_t end) {
-  EXPECT_EQ(line.hash, Md5(text));
+  EXPECT_EQ(line.hash, Md5Of(text));
   EXPECT_EQ(line.length, static_cast<int64_t>(text.size()));
   EXPECT_EQ(line.end, static_cast<int64_t>(end));
 }

@@ -14,6 +14,7 @@
 #include "quendel.h"
 #include "support/appliance.h"
 #include "support/calls.h"
+#include "support/device.h"
 #include "support/json.h"
 #include "support/log.h"
 #include "support/own_work.h"
@@ -40,13 +41,6 @@ constexpr char kUdcUpdateFile[] = "/tmp/quendel/quendel.udc.update.conf";
 
 std::string UdcConf(const std::string& name) {
   return std::string(kConfFolder) + "/quendel.udc." + name;
-}
-
-void InstallUdc(const std::string& name, const std::string& output) {
-  const std::string program = "/volume1/" + name;
-  WriteFile(UdcConf(name), "name=" + name + "\npath=" + program + "\nlast_hash=\"\"\n");
-  WriteFile(program, "#!/bin/sh\necho '" + output + "'\n");
-  ASSERT_EQ(chmod(program.c_str(), 0700), 0);
 }
 
 // Installs logs of each of which a new archive, a newer one and new lines wait to be collected.
@@ -82,7 +76,7 @@ TEST(CollectorsNoMemoryTest, StagesNoUserDefinedCollectorWithoutItsResult) {
       {"b", R"("printed by the second of the collectors")"},
   };
   for (const auto& [name, output] : outputs) {
-    InstallUdc(name, output);
+    InstallUdc(name, "echo '" + output + "'");
   }
   int failures = 0;
   int partial = 0;

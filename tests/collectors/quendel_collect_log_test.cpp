@@ -6,11 +6,12 @@
 #include <filesystem>
 
 #include "model/collector_files.h"
-#include "model/xz.h"
 #include "quendel.h"
 #include "support/appliance.h"
 #include "support/calls.h"
+#include "support/device.h"
 #include "support/log.h"
+#include "support/xz.h"
 
 using namespace quendel::test;
 using testing::Contains;
@@ -30,18 +31,6 @@ namespace fs = std::filesystem;
 constexpr char kLog[] = "/volume1/messages";
 const std::string kOutput = std::string(kRunFolder) + "/m";
 constexpr char kEmptyMd5[] = "d41d8cd98f00b204e9800998ecf8427e";
-
-std::string Md5(const std::string& text) {
-  char digits[33];
-  QUENDELMD5String(text, digits);
-  return digits;
-}
-
-uint64_t InodeOf(const std::string& path) {
-  struct stat status = {};
-  EXPECT_EQ(stat(path.c_str(), &status), 0) << path;
-  return status.st_ino;
-}
 
 std::string Inode(const std::string& path) {
   return std::to_string(InodeOf(path));
@@ -105,7 +94,7 @@ Pairs StagedOf(const std::string& conf) {
 }
 
 Pairs LineState(const std::string& line, size_t total) {
-  return {{"last_hash", Md5(line)},
+  return {{"last_hash", Md5Of(line)},
           {"last_byte", std::to_string(line.size())},
           {"total_byte", std::to_string(total)}};
 }
@@ -630,7 +619,7 @@ TEST(CollectLogTest, LooksForTheLastLineInAllOfTheOutput) {
   EXPECT_EQ(Collect(), 0);
   EXPECT_THAT(Delivered(), UnorderedElementsAre(Pair("m", "two\n")));
   const Pairs staged = StagedOf(conf);
-  EXPECT_EQ(staged.at("last_hash"), Md5("two"));
+  EXPECT_EQ(staged.at("last_hash"), Md5Of("two"));
   EXPECT_EQ(staged.at("total_byte"), "0");
   EXPECT_EQ(staged.at("last_byte"), "3");
 }
@@ -965,7 +954,7 @@ TEST(CollectLogTest, SendsAnArchiveWholeWhoseStateCannotBeStaged) {
   const std::string conf = InstallRotated("one\n", {"two\n", "three\n"});
   On("ALIBCSzHashSetValue").Nth(1).Return(-1);
   EXPECT_EQ(Collect(), 0);
-  EXPECT_THAT(Log(), LoggedInOrder(FailedPair("last_hash", Md5("two"), conf),
+  EXPECT_THAT(Log(), LoggedInOrder(FailedPair("last_hash", Md5Of("two"), conf),
                                    "Failed to update config of log " + Quoted(kOutput + ".1"),
                                    "Failed to collect diff log " + Quoted(kOutput + ".1")));
   EXPECT_THAT(Delivered(), Contains(Pair("m.1.xz", "one\ntwo\n")));

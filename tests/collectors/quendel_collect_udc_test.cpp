@@ -18,6 +18,7 @@
 #include "quendel.h"
 #include "support/appliance.h"
 #include "support/calls.h"
+#include "support/device.h"
 #include "support/log.h"
 
 using namespace quendel::test;
@@ -30,16 +31,9 @@ namespace {
 
 namespace fs = std::filesystem;
 
-constexpr char kConfFolder[] = "/usr/arvo/etc/quendel";
 constexpr char kUpdateFile[] = "/tmp/quendel/quendel.udc.update.conf";
 constexpr char kRunFolder[] = "/tmp/quendel_run/udc";
 const std::string kResult = std::string(kRunFolder) + "/udc.result";
-
-std::string Md5(const std::string& text) {
-  char digits[33];
-  QUENDELMD5String(text, digits);
-  return digits;
-}
 
 std::string ConfOf(const std::string& name) {
   return std::string(kConfFolder) + "/quendel.udc." + name;
@@ -47,13 +41,6 @@ std::string ConfOf(const std::string& name) {
 
 std::string PathOf(const std::string& name) {
   return "/volume1/" + name;
-}
-
-// Installs a collector, which is the shell script `body`, and that has delivered nothing yet.
-void Install(const std::string& name, const std::string& body) {
-  WriteFile(ConfOf(name), "name=" + name + "\npath=" + PathOf(name) + "\nlast_hash=\"\"\n");
-  WriteFile(PathOf(name), "#!/bin/sh\n" + body + "\n");
-  ASSERT_EQ(chmod(PathOf(name).c_str(), 0755), 0);
 }
 
 // Runs the collectors into an emptied folder.
@@ -87,7 +74,7 @@ std::string Staged() {
 }
 
 std::string Section(const std::string& name, const std::string& output) {
-  return "[" + ConfOf(name) + "]\nlast_hash=" + Md5(output) + "\n";
+  return "[" + ConfOf(name) + "]\nlast_hash=" + Md5Of(output) + "\n";
 }
 
 template <typename... Messages>
@@ -164,7 +151,7 @@ TEST(CollectUDCTest, RemovesWhatAnEarlierRunStaged) {
 }
 
 TEST(CollectUDCTest, GoesOnWhenWhatWasStagedCannotBeRemoved) {
-  Install("a", "echo 1");
+  InstallUdc("a", "echo 1");
   WriteFile(kUpdateFile, "");
   On("remove").With(kUpdateFile).Return(-1, EPERM);
   EXPECT_EQ(Collect(), 0);
@@ -176,8 +163,8 @@ TEST(CollectUDCTest, GoesOnWhenWhatWasStagedCannotBeRemoved) {
 // ---- Results ----
 
 TEST(CollectUDCTest, SendsNewOutputAndStagesItsHash) {
-  Install("a", "echo '{\"disks\": [1, 2]}'");
-  Install("b", "echo '\"text\"'");
+  InstallUdc("a", "echo '{\"disks\": [1, 2]}'");
+  InstallUdc("b", "echo '\"text\"'");
   EXPECT_EQ(Collect(), 0);
   EXPECT_EQ(Results(), Parsed(R"({"a": {"disks": [1, 2]}, "b": "text"})"));
   EXPECT_EQ(Staged(), Section("a", "{\"disks\": [1, 2]}\n") + Section("b", "\"text\"\n"));
@@ -185,7 +172,7 @@ TEST(CollectUDCTest, SendsNewOutputAndStagesItsHash) {
 }
 
 TEST(CollectUDCTest, SendsSameForOutputThatWasDelivered) {
-  Install("a", "echo '{\"disks\": 2}'");
+  InstallUdc("a", "echo '{\"disks\": 2}'");
   Collect();
   Commit();
   EXPECT_EQ(Collect(), 0);
@@ -195,32 +182,32 @@ TEST(CollectUDCTest, SendsSameForOutputThatWasDelivered) {
 }
 
 TEST(CollectUDCTest, SendsOutputAgainThatWasNotCommitted) {
-  Install("a", "echo 1");
+  InstallUdc("a", "echo 1");
   Collect();
   Collect();
   EXPECT_EQ(Results(), Parsed(R"({"a": 1})"));
 }
 
 TEST(CollectUDCTest, LeavesTheConfigurationFilesAlone) {
-  Install("a", "echo 1");
+  InstallUdc("a", "echo 1");
   const std::string before = ReadFile(ConfOf("a"));
   Collect();
   EXPECT_EQ(ReadFile(ConfOf("a")), before);
 }
 
 TEST(CollectUDCTest, TellsOutputApartByEveryByte) {
-  Install("a", "printf '1'");
+  InstallUdc("a", "printf '1'");
   Collect();
   Commit();
-  Install("a", "printf '1 '");
-  WriteFile(ConfOf("a"), "name=a\npath=" + PathOf("a") + "\nlast_hash=" + Md5("1") + "\n");
+  InstallUdc("a", "printf '1 '");
+  WriteFile(ConfOf("a"), "name=a\npath=" + PathOf("a") + "\nlast_hash=" + Md5Of("1") + "\n");
   Collect();
   EXPECT_EQ(Results(), Parsed(R"({"a": 1})"));
 }
 
 TEST(CollectUDCTest, LeavesOutWhatPrintsNoJson) {
-  Install("a", "echo no JSON");
-  Install("b", "echo 2");
+  InstallUdc("a", "echo no JSON");
+  InstallUdc("b", "echo 2");
   for (int run = 0; run < 2; ++run) {
     ClearLog();
     EXPECT_EQ(Collect(), 0);
@@ -231,21 +218,21 @@ TEST(CollectUDCTest, LeavesOutWhatPrintsNoJson) {
 }
 
 TEST(CollectUDCTest, LeavesOutWhatPrintsNothing) {
-  Install("a", "exit 0");
+  InstallUdc("a", "exit 0");
   EXPECT_EQ(Collect(), 0);
   EXPECT_EQ(ReadFile(kResult), "null");
   EXPECT_THAT(Log(), LoggedInOrder("Failed to set json value of '" + PathOf("a") + "'"));
 }
 
 TEST(CollectUDCTest, KnowsTheEmptyOutputByItsHash) {
-  Install("a", "exit 0");
-  WriteFile(ConfOf("a"), "name=a\npath=" + PathOf("a") + "\nlast_hash=" + Md5("") + "\n");
+  InstallUdc("a", "exit 0");
+  WriteFile(ConfOf("a"), "name=a\npath=" + PathOf("a") + "\nlast_hash=" + Md5Of("") + "\n");
   EXPECT_EQ(Collect(), 0);
   EXPECT_EQ(Results(), Parsed(R"({"a": "Same"})"));
 }
 
 TEST(CollectUDCTest, TakesOutputOfAnyLength) {
-  Install(
+  InstallUdc(
       "a",
       "printf '['; i=0; while [ $i -lt 3000 ]; do printf '%d,' $i; i=$((i+1)); done; echo '0]'");
   EXPECT_EQ(Collect(), 0);
@@ -255,27 +242,27 @@ TEST(CollectUDCTest, TakesOutputOfAnyLength) {
 TEST(CollectUDCTest, TakesOutputOfWholeChunks) {
   for (const int length : {1023, 1024, 1025, 2048}) {
     const std::string name = "a" + std::to_string(length);
-    Install(name, "printf '\"%" + std::to_string(length - 2) + "s\"' x");
+    InstallUdc(name, "printf '\"%" + std::to_string(length - 2) + "s\"' x");
     EXPECT_EQ(Collect(), 0);
     EXPECT_EQ(Results()[name].asString().size(), static_cast<size_t>(length - 2));
   }
 }
 
 TEST(CollectUDCTest, LeavesOutJsonThatNestsTooDeeply) {
-  Install("a", "printf '%02000d' 0 | tr 0 '['; printf '%02000d' 0 | tr 0 ']'");
+  InstallUdc("a", "printf '%02000d' 0 | tr 0 '['; printf '%02000d' 0 | tr 0 ']'");
   EXPECT_EQ(Collect(), 0);
   EXPECT_THAT(Log(), LoggedInOrder("Failed to set json value of '" + PathOf("a") + "'"));
 }
 
 TEST(CollectUDCTest, IgnoresTheExitStatus) {
-  Install("a", "echo 1; exit 3");
+  InstallUdc("a", "echo 1; exit 3");
   EXPECT_EQ(Collect(), 0);
   EXPECT_EQ(Results(), Parsed(R"({"a": 1})"));
 }
 
 TEST(CollectUDCTest, LetsTheLaterOfTwoWithOneNameWin) {
-  Install("a", "echo 1");
-  Install("b", "echo 2");
+  InstallUdc("a", "echo 1");
+  InstallUdc("b", "echo 2");
   WriteFile(ConfOf("b"), "name=a\npath=" + PathOf("b") + "\nlast_hash=\"\"\n");
   EXPECT_EQ(Collect(), 0);
   EXPECT_EQ(Results(), Parsed(R"({"a": 2})"));
@@ -283,7 +270,7 @@ TEST(CollectUDCTest, LetsTheLaterOfTwoWithOneNameWin) {
 }
 
 TEST(CollectUDCTest, RunsTheProgramWithoutArguments) {
-  Install("a", "echo $#");
+  InstallUdc("a", "echo $#");
   Record("ALIBCPopen");
   EXPECT_EQ(Collect(), 0);
   EXPECT_EQ(Results(), Parsed(R"({"a": 0})"));
@@ -293,8 +280,8 @@ TEST(CollectUDCTest, RunsTheProgramWithoutArguments) {
 // ---- Collectors that cannot be run ----
 
 TEST(CollectUDCTest, FilesAnUnreadableNameUnderTheOneBefore) {
-  Install("a", "echo 1");
-  Install("b", "echo 2");
+  InstallUdc("a", "echo 1");
+  InstallUdc("b", "echo 2");
   WriteFile(ConfOf("b"), "path=" + PathOf("b") + "\nlast_hash=\"\"\n");
   EXPECT_EQ(Collect(), 0);
   EXPECT_EQ(Results(), Parsed(R"({"a": "Error"})"));
@@ -310,14 +297,14 @@ TEST(CollectUDCTest, FilesAFirstUnreadableNameUnderAnEmptyOne) {
 }
 
 TEST(CollectUDCTest, FilesAnUnreadablePathUnderItsOwnName) {
-  Install("a", "echo 1");
+  InstallUdc("a", "echo 1");
   WriteFile(ConfOf("b"), "name=b\nlast_hash=\"\"\n");
   EXPECT_EQ(Collect(), 0);
   EXPECT_EQ(Results(), Parsed(R"({"a": 1, "b": "Error"})"));
 }
 
 TEST(CollectUDCTest, SendsErrorForAMissingProgram) {
-  Install("a", "");
+  InstallUdc("a", "");
   RemoveFile(PathOf("a"));
   EXPECT_EQ(Collect(), 0);
   EXPECT_EQ(Results(), Parsed(R"({"a": "Error"})"));
@@ -325,7 +312,7 @@ TEST(CollectUDCTest, SendsErrorForAMissingProgram) {
 }
 
 TEST(CollectUDCTest, SendsErrorForAProgramWithoutPermission) {
-  Install("a", "echo 1");
+  InstallUdc("a", "echo 1");
   ASSERT_EQ(chmod(PathOf("a").c_str(), 0644), 0);
   EXPECT_EQ(Collect(), 0);
   EXPECT_EQ(Results(), Parsed(R"({"a": "Error"})"));
@@ -334,9 +321,9 @@ TEST(CollectUDCTest, SendsErrorForAProgramWithoutPermission) {
 }
 
 TEST(CollectUDCTest, SendsErrorForAProgramThatDoesNotStart) {
-  Install("a", "");
+  InstallUdc("a", "");
   WriteFile(PathOf("a"), "#!/no/such/interpreter\n");
-  Install("b", "");
+  InstallUdc("b", "");
   RemoveFile(PathOf("b"));
   fs::create_directory(PathOf("b"));
   EXPECT_EQ(Collect(), 0);
@@ -346,7 +333,7 @@ TEST(CollectUDCTest, SendsErrorForAProgramThatDoesNotStart) {
 }
 
 TEST(CollectUDCTest, SendsErrorForOutputThatCannotBeReadToItsEnd) {
-  Install("a", "");
+  InstallUdc("a", "");
   // A stream that gives a valid result, and then an error where its end should be.
   cookie_io_functions_t functions = {};
   functions.read = [](void* calls, char* buffer, size_t) -> ssize_t {
@@ -367,7 +354,7 @@ TEST(CollectUDCTest, SendsErrorForOutputThatCannotBeReadToItsEnd) {
 }
 
 TEST(CollectUDCTest, TakesALoopOfLinksForAMissingProgram) {
-  Install("a", "");
+  InstallUdc("a", "");
   RemoveFile(PathOf("a"));
   fs::create_symlink(PathOf("a"), PathOf("a"));
   EXPECT_EQ(Collect(), 0);
@@ -375,9 +362,9 @@ TEST(CollectUDCTest, TakesALoopOfLinksForAMissingProgram) {
 }
 
 TEST(CollectUDCTest, GoesOnToTheNextCollectorAfterAFailure) {
-  Install("a", "echo 1");
+  InstallUdc("a", "echo 1");
   RemoveFile(PathOf("a"));
-  Install("b", "echo 2");
+  InstallUdc("b", "echo 2");
   EXPECT_EQ(Collect(), 0);
   EXPECT_EQ(Results(), Parsed(R"({"a": "Error", "b": 2})"));
 }
@@ -385,18 +372,18 @@ TEST(CollectUDCTest, GoesOnToTheNextCollectorAfterAFailure) {
 // ---- State that cannot be staged ----
 
 TEST(CollectUDCTest, LeavesOutWhatCannotBeRemembered) {
-  Install("a", "echo 1");
+  InstallUdc("a", "echo 1");
   On("ALIBCSzHashSetValue").Nth(1).Return(-1);
   EXPECT_EQ(Collect(), 0);
   EXPECT_EQ(ReadFile(kResult), "null");
   EXPECT_THAT(Log(), LoggedInOrder("Failed to set hash of conf '" + ConfOf("a") + "' to '" +
-                                   Md5("1\n") + "'"));
+                                   Md5Of("1\n") + "'"));
 }
 
 TEST(CollectUDCTest, LeavesOutWhatCannotBeStaged) {
   for (const long answer : {0L, -1L}) {
     ClearLog();
-    Install("a", "echo 1");
+    InstallUdc("a", "echo 1");
     On("ALIBCFileAddSection").Nth(1).Return(answer);
     EXPECT_EQ(Collect(), 0);
     EXPECT_EQ(ReadFile(kResult), "null");
@@ -408,7 +395,7 @@ TEST(CollectUDCTest, LeavesOutWhatCannotBeStaged) {
 // ---- A result file that cannot be written ----
 
 TEST(CollectUDCTest, FailsWhenTheResultFileCannotBeOpened) {
-  Install("a", "echo 1");
+  InstallUdc("a", "echo 1");
   fs::create_directories("/tmp/quendel");
   EXPECT_EQ(QUENDELCollectUDC("/tmp/missing"), -1);
   EXPECT_THAT(Log(), LoggedInOrder("Failed to open file '/tmp/missing/udc.result'"));
@@ -416,7 +403,7 @@ TEST(CollectUDCTest, FailsWhenTheResultFileCannotBeOpened) {
 }
 
 TEST(CollectUDCTest, FailsWhenTheResultFileCannotBeWrittenWhole) {
-  Install("a", "printf '\"%20000s\"' x");
+  InstallUdc("a", "printf '\"%20000s\"' x");
   fs::create_directories(kRunFolder);
   fs::create_directories("/tmp/quendel");
   ASSERT_EQ(mount("small", kRunFolder, "tmpfs", 0, "size=4k"), 0);
@@ -430,7 +417,7 @@ TEST(CollectUDCTest, FailsWhenTheResultFileCannotBeWrittenWhole) {
 
 // So little text is not written before the file is closed.
 TEST(CollectUDCTest, FailsWhenTheResultFileCannotBeClosed) {
-  Install("a", "echo 1");
+  InstallUdc("a", "echo 1");
   fs::create_directories(kRunFolder);
   fs::create_directories("/tmp/quendel");
   ASSERT_EQ(mount("small", kRunFolder, "tmpfs", 0, "size=4k"), 0);
@@ -442,7 +429,7 @@ TEST(CollectUDCTest, FailsWhenTheResultFileCannotBeClosed) {
 }
 
 TEST(CollectUDCTest, ReplacesAnOldResultFile) {
-  Install("a", "echo 1");
+  InstallUdc("a", "echo 1");
   fs::create_directories("/tmp/quendel");
   WriteFile(kResult, std::string(1000, 'x'));
   EXPECT_EQ(QUENDELCollectUDC(kRunFolder), 0);
@@ -452,26 +439,26 @@ TEST(CollectUDCTest, ReplacesAnOldResultFile) {
 // ---- Collectors that misbehave ----
 
 TEST(CollectUDCTest, TakesWhatACollectorPrintedBeforeItDied) {
-  Install("a", "echo 1; kill -KILL $$");
+  InstallUdc("a", "echo 1; kill -KILL $$");
   EXPECT_EQ(Collect(), 0);
   EXPECT_EQ(Results(), Parsed(R"({"a": 1})"));
 }
 
 TEST(CollectUDCTest, WaitsForACollectorThatClosedItsOutput) {
-  Install("a", "echo 1; exec >&-; sleep 0.3; touch /volume1/ended");
+  InstallUdc("a", "echo 1; exec >&-; sleep 0.3; touch /volume1/ended");
   EXPECT_EQ(Collect(), 0);
   EXPECT_EQ(Results(), Parsed(R"({"a": 1})"));
   EXPECT_TRUE(Exists("/volume1/ended"));
 }
 
 TEST(CollectUDCTest, WaitsForWhateverHoldsTheOutputOpen) {
-  Install("a", "printf '[1'; (sleep 0.3; echo ',2]') & exit 0");
+  InstallUdc("a", "printf '[1'; (sleep 0.3; echo ',2]') & exit 0");
   EXPECT_EQ(Collect(), 0);
   EXPECT_EQ(Results(), Parsed(R"({"a": [1, 2]})"));
 }
 
 TEST(CollectUDCTest, LeavesAProcessAloneThatACollectorStarted) {
-  Install("a", "sleep 60 >/dev/null & echo $!");
+  InstallUdc("a", "sleep 60 >/dev/null & echo $!");
   const auto start = std::chrono::steady_clock::now();
   EXPECT_EQ(Collect(), 0);
   EXPECT_LT(std::chrono::steady_clock::now() - start, std::chrono::seconds(30));
@@ -481,14 +468,14 @@ TEST(CollectUDCTest, LeavesAProcessAloneThatACollectorStarted) {
 }
 
 TEST(CollectUDCTest, GivesTheCollectorNothingToRead) {
-  Install("a", "cat; echo 1");
+  InstallUdc("a", "cat; echo 1");
   EXPECT_EQ(Collect(), 0);
   EXPECT_EQ(Results(), Parsed(R"({"a": 1})"));
 }
 
 // The driver ends the run's child after its time limit. Nothing is delivered or staged then.
 TEST(CollectUDCTest, EndsWithTheSignalOfItsDriverWhileACollectorHangs) {
-  Install("a", "touch /volume1/started; exec sleep 60");
+  InstallUdc("a", "touch /volume1/started; exec sleep 60");
   const pid_t child = fork();
   ASSERT_GE(child, 0);
   if (child == 0) {
@@ -507,15 +494,15 @@ TEST(CollectUDCTest, EndsWithTheSignalOfItsDriverWhileACollectorHangs) {
 }
 
 TEST(CollectUDCTest, TakesAFloodThatFitsTheMemory) {
-  Install("a", "printf '\"'; head -c 20000000 /dev/zero | tr '\\0' x; printf '\"'");
+  InstallUdc("a", "printf '\"'; head -c 20000000 /dev/zero | tr '\\0' x; printf '\"'");
   EXPECT_EQ(Collect(), 0);
   EXPECT_EQ(Results()["a"].asString().size(), 20000000u);
 }
 
 #ifndef __SANITIZE_ADDRESS__  // which reserves more memory than the limit below allows
 TEST(CollectUDCTest, SendsErrorForAFloodThatDoesNot) {
-  Install("a", "ulimit -v unlimited; exec cat /dev/zero");
-  Install("b", "ulimit -v unlimited; echo 2");
+  InstallUdc("a", "ulimit -v unlimited; exec cat /dev/zero");
+  InstallUdc("b", "ulimit -v unlimited; echo 2");
   size_t pages = 0;
   std::ifstream("/proc/self/statm") >> pages;
   rlimit limit = {};

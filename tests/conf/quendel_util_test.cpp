@@ -7,6 +7,7 @@
 #include "quendel.h"
 #include "support/appliance.h"
 #include "support/calls.h"
+#include "support/device.h"
 #include "support/log.h"
 
 using namespace quendel::test;
@@ -38,12 +39,6 @@ std::string Bytes(const std::string& hex, int maxlen) {
   return out.substr(0, rest);
 }
 
-mode_t ModeOf(const std::string& path) {
-  struct stat status = {};
-  stat(path.c_str(), &status);
-  return status.st_mode & 07777;
-}
-
 }  // namespace
 
 TEST(FileCopyTest, CopiesAFile) {
@@ -72,7 +67,7 @@ TEST(RecursiveMkdirTest, RunsTheToolWithThePathBeforeTheMode) {
   Record("ALIBCExec");
   EXPECT_EQ(QUENDELRecursiveMkdir("/tmp/a/b", 0700), 0);
   EXPECT_THAT(Recorded(), ElementsAre("/bin/mkdir|-p|/tmp/a/b|-m|700"));
-  EXPECT_EQ(ModeOf("/tmp/a/b"), 0700u);
+  EXPECT_EQ(ModeOf("/tmp/a/b"), S_IFDIR | 0700u);
 }
 
 TEST(RecursiveMkdirTest, WritesTheModeInOctalWithoutALeadingZero) {

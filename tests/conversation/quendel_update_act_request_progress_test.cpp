@@ -26,12 +26,6 @@ int Report(int requestId, int progress, const Json::Value& details = kEmptyObjec
                                          details);
 }
 
-// The request line of the only request so far.
-std::string RequestLine() {
-  EXPECT_EQ(Requests().size(), 1U);
-  return Requests().at(0).line;
-}
-
 }  // namespace
 
 TEST(UpdateActRequestProgressTest, NamesRequestAndProgressInTheUrl) {

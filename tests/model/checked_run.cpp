@@ -9,12 +9,12 @@
 #include <sstream>
 
 #include "model/collector_files.h"
-#include "model/xz.h"
 #include "platform/file.h"
 #include "quendel.h"
 #include "support/appliance.h"
 #include "support/calls.h"
 #include "support/log.h"
+#include "support/xz.h"
 
 namespace quendel::test {
 namespace {

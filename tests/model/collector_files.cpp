@@ -8,12 +8,12 @@
 #include <fstream>
 #include <sstream>
 
-#include "model/xz.h"
 #include "platform/file.h"
 #include "quendel.h"
 #include "support/appliance.h"
 #include "support/calls.h"
 #include "support/log.h"
+#include "support/xz.h"
 
 namespace quendel::test {
 namespace {
@@ -35,26 +35,7 @@ Sections ReadSections(const std::string& path) {
   return sections;
 }
 
-void PushArchive(const std::string& log, const std::string& text) {
-  int number = 1;
-  while (Exists(ArchiveOf(log, number))) {
-    ++number;
-  }
-  for (; number > 1; --number) {
-    fs::rename(ArchiveOf(log, number - 1), ArchiveOf(log, number));
-  }
-  WriteFile(ArchiveOf(log, 1), Xz(text));
-}
-
 }  // namespace
-
-std::string InstallLog(const std::string& name, const std::string& path) {
-  const std::string conf = std::string(kConfFolder) + "/quendel.log." + name;
-  WriteFile(conf, "name=" + name + "\npath=" + path +
-                      "\nlast_hash=\"\"\ntar_log_inode=\"\"\nlast_byte=\"\"\ntotal_byte=\"\"\n"
-                      "inode=\"\"\n");
-  return conf;
-}
 
 Pairs ReadPairs(const std::string& path) {
   return ReadSections(path).front().second;
@@ -64,30 +45,6 @@ Sections ReadStaged() {
   Sections sections = ReadSections(kLogUpdateFile);
   sections.erase(sections.begin());
   return sections;
-}
-
-void AppendFile(const std::string& path, const std::string& text) {
-  std::ofstream out(path, std::ios::binary | std::ios::app);
-  out << text << std::flush;
-  ASSERT_TRUE(out) << path;
-}
-
-std::string ArchiveOf(const std::string& log, int number) {
-  return log + "." + std::to_string(number) + ".xz";
-}
-
-void Rotate(const std::string& log) {
-  const std::string text = ReadFile(log);
-  // The new log is there before the old one goes, so that it cannot have the old one's inode.
-  fs::rename(log, log + ".1");
-  WriteFile(log, "");
-  PushArchive(log, text);
-  fs::remove(log + ".1");
-}
-
-void CopyTruncate(const std::string& log) {
-  PushArchive(log, ReadFile(log));
-  fs::resize_file(log, 0);
 }
 
 void ShowInode(const std::string& path, uint64_t inode) {

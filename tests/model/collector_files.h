@@ -10,32 +10,19 @@
 #include <utility>
 #include <vector>
 
+#include "support/device.h"
+
 namespace quendel::test {
 
-inline constexpr char kConfFolder[] = "/usr/arvo/etc/quendel";
 inline constexpr char kLogUpdateFile[] = "/tmp/quendel/quendel.log.update.conf";
 inline constexpr char kRunFolder[] = "/tmp/quendel_run/log";
 
 using Pairs = std::map<std::string, std::string>;
 using Sections = std::vector<std::pair<std::string, Pairs>>;
 
-// Installs a log collector that has collected nothing yet. Returns the path of its configuration
-// file, "/usr/arvo/etc/quendel/quendel.log." and the name.
-std::string InstallLog(const std::string& name, const std::string& path);
-
 // The pairs of a configuration file, and the sections of what the last run staged.
 Pairs ReadPairs(const std::string& path);
 Sections ReadStaged();
-
-void AppendFile(const std::string& path, const std::string& text);
-
-// Moves the log's archives up by one number, makes its text archive 1, and leaves the log as a new
-// empty file (Rotate) or as the old one, emptied (CopyTruncate).
-void Rotate(const std::string& log);
-void CopyTruncate(const std::string& log);
-
-// The path of a log's archive.
-std::string ArchiveOf(const std::string& log, int number);
 
 // Gives a path this inode number from now on, whatever file is there.
 void ShowInode(const std::string& path, uint64_t inode);

@@ -8,16 +8,16 @@
 #include <unistd.h>
 
 #include <filesystem>
-#include <random>
 #include <regex>
 #include <set>
 
 #include "model/checked_run.h"
 #include "model/collector_files.h"
 #include "model/loop_mount.h"
-#include "model/xz.h"
 #include "quendel.h"
 #include "support/appliance.h"
+#include "support/random.h"
+#include "support/xz.h"
 
 using namespace quendel::test;
 
@@ -78,8 +78,8 @@ class History {
     std::string unfinished;  // what was written of the last line
   };
 
-  int Below(int limit) { return static_cast<int>(random_() % static_cast<unsigned>(limit)); }
-  bool OneIn(int times) { return Below(times) == 0; }
+  int Below(int limit) { return random_.Below(limit); }
+  bool OneIn(int times) { return random_.OneIn(times); }
 
   void AddLog(int number) {
     const std::string digit = std::to_string(number);
@@ -340,7 +340,7 @@ class History {
   }
 
   Kind kind_;
-  std::mt19937 random_;
+  Random random_;
   int steps_;
   std::string logRoot_;
   std::string graveRoot_;

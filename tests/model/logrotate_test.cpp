@@ -5,7 +5,6 @@
 
 #include <cstdlib>
 #include <filesystem>
-#include <random>
 #include <regex>
 #include <set>
 #include <sstream>
@@ -14,6 +13,7 @@
 #include "model/collector_files.h"
 #include "model/loop_mount.h"
 #include "support/appliance.h"
+#include "support/random.h"
 
 using namespace quendel::test;
 
@@ -145,17 +145,17 @@ INSTANTIATE_TEST_SUITE_P(FileSystems, LogrotateTest, testing::Values("tmpfs", "e
                          [](const auto& type) { return std::string(type.param); });
 
 TEST_P(LogrotateTest, TheCollectorFollowsTheModelWithTheConfigurationsAsTheyAre) {
-  std::mt19937 random(1);
+  Random random(1);
   size_t logs = 0;
   for (const auto& [name, config] : configs_) {
     SCOPED_TRACE(name);
     Packaged packaged(config, GetParam());
     logs += packaged.logs().size();
     for (int i = 0; i < kRotations && !HasFatalFailure(); ++i) {
-      packaged.Append(random() % 3);
-      if (random() % 2 == 0) {
+      packaged.Append(random.Below(3));
+      if (random.OneIn(2)) {
         packaged.CollectAndCommit();
-        packaged.Append(random() % 3);
+        packaged.Append(random.Below(3));
       }
       Packaged::RotateAll();
     }
@@ -166,17 +166,17 @@ TEST_P(LogrotateTest, TheCollectorFollowsTheModelWithTheConfigurationsAsTheyAre)
 
 // As docs/delivery-guarantee.md asks for: no delayed compression, and a run after each rotation.
 TEST_P(LogrotateTest, NoLineIsLostWithoutDelayedCompression) {
-  std::mt19937 random(2);
+  Random random(2);
   KnowFilesByBirth();
   for (const auto& [name, config] : configs_) {
     SCOPED_TRACE(name);
     Packaged packaged(std::regex_replace(config, std::regex("[ \\t]*delaycompress[ \\t]*\\n"), ""),
                       GetParam());
     for (int i = 0; i < kRotations && !HasFatalFailure(); ++i) {
-      packaged.Append(1 + random() % 3);
-      if (random() % 2 == 0) {
+      packaged.Append(1 + random.Below(3));
+      if (random.OneIn(2)) {
         packaged.CollectAndCommit();
-        packaged.Append(random() % 3);
+        packaged.Append(random.Below(3));
       }
       Packaged::RotateAll();
       packaged.Append(1);

@@ -7,13 +7,14 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include <random>
 #include <string>
 
 #include "platform/error.h"
 #include "platform/file.h"
 #include "support/appliance.h"
 #include "support/calls.h"
+#include "support/device.h"
+#include "support/random.h"
 
 using namespace quendel::test;
 
@@ -22,12 +23,6 @@ namespace {
 constexpr char kFrom[] = "/tmp/from";
 constexpr char kTo[] = "/tmp/to";
 
-struct stat StatusOf(const char* path) {
-  struct stat status = {};
-  EXPECT_EQ(stat(path, &status), 0) << path;
-  return status;
-}
-
 int Copy() {
   // The record that the library passes: two of its flag words are 1.
   unsigned int options[20] = {1, 0, 1};
@@ -35,14 +30,7 @@ int Copy() {
 }
 
 std::string RandomBytes(size_t size) {
-  std::mt19937_64 random(size);
-  std::string bytes;
-  while (bytes.size() < size) {
-    const auto word = random();
-    bytes.append(reinterpret_cast<const char*>(&word), sizeof(word));
-  }
-  bytes.resize(size);
-  return bytes;
+  return Random(static_cast<unsigned>(size)).Bytes(size);
 }
 
 void WriteAt(const char* path, off_t offset, const std::string& text) {

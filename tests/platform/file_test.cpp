@@ -10,11 +10,12 @@
 #include <string>
 #include <vector>
 
-#include "containers.h"
+#include "platform/containers.h"
 #include "platform/error.h"
 #include "platform/owned.h"
 #include "support/appliance.h"
 #include "support/calls.h"
+#include "support/device.h"
 
 using namespace quendel::test;
 using testing::ElementsAre;
@@ -23,16 +24,6 @@ using testing::IsEmpty;
 namespace {
 
 constexpr uid_t kNobody = 65534;
-
-struct stat StatusOf(const std::string& path) {
-  struct stat status = {};
-  EXPECT_EQ(stat(path.c_str(), &status), 0) << path;
-  return status;
-}
-
-mode_t ModeOf(const std::string& path) {
-  return StatusOf(path).st_mode & 07777;
-}
 
 int Enum(const char* dir, const char* prefix, platform::OwnedList& names) {
   return ALIBCFileEnumDir(dir, prefix, names.slot(), 130);
@@ -138,7 +129,7 @@ TEST(FileTouchTest, CreatesAnEmptyFile) {
   umask(022);
   EXPECT_EQ(ALIBCFileTouch("/tmp/new"), 0);
   EXPECT_EQ(ReadFile("/tmp/new"), "");
-  EXPECT_EQ(ModeOf("/tmp/new"), 0644U);
+  EXPECT_EQ(ModeOf("/tmp/new"), S_IFREG | 0644U);
 }
 
 TEST(FileTouchTest, SetsTheTimesOfWhatIsThere) {
@@ -259,24 +250,24 @@ TEST(FileEnumDirTest, RefusesOtherArguments) {
 TEST(FSMkdirPTest, CreatesADirectoryAndItsParents) {
   umask(077);
   EXPECT_EQ(MakePath("/tmp/a/b/c", 0755), 0);
-  EXPECT_EQ(ModeOf("/tmp/a"), 0755U);
-  EXPECT_EQ(ModeOf("/tmp/a/b"), 0755U);
-  EXPECT_EQ(ModeOf("/tmp/a/b/c"), 0755U);
+  EXPECT_EQ(ModeOf("/tmp/a"), S_IFDIR | 0755U);
+  EXPECT_EQ(ModeOf("/tmp/a/b"), S_IFDIR | 0755U);
+  EXPECT_EQ(ModeOf("/tmp/a/b/c"), S_IFDIR | 0755U);
 }
 
 TEST(FSMkdirPTest, GivesExactlyTheMode) {
   umask(0);
   EXPECT_EQ(MakePath("/tmp/a", 0700), 0);
-  EXPECT_EQ(ModeOf("/tmp/a"), 0700U);
+  EXPECT_EQ(ModeOf("/tmp/a"), S_IFDIR | 0700U);
   EXPECT_EQ(MakePath("/tmp/b/c", 01311), 0);
-  EXPECT_EQ(ModeOf("/tmp/b/c"), 01311U);
+  EXPECT_EQ(ModeOf("/tmp/b/c"), S_IFDIR | 01311U);
 }
 
 TEST(FSMkdirPTest, LeavesWhatIsThereAsItIs) {
   mkdir("/tmp/a", 0750);
   EXPECT_EQ(MakePath("/tmp/a", 0700, 50001, 100), 0);
   EXPECT_EQ(MakePath("/tmp/a/b", 0700), 0);
-  EXPECT_EQ(ModeOf("/tmp/a"), 0750U);
+  EXPECT_EQ(ModeOf("/tmp/a"), S_IFDIR | 0750U);
   EXPECT_EQ(StatusOf("/tmp/a").st_uid, 0U);
 }
 
@@ -311,8 +302,8 @@ TEST(FSMkdirPTest, FollowsALinkToADirectory) {
 TEST(FSMkdirPTest, TakesADirectoryThatSomebodyElseMakesMeanwhile) {
   On("mkdirat").InPlatform().Nth(1).Before([] { mkdir("/tmp/a", 0750); });
   EXPECT_EQ(MakePath("/tmp/a/b", 0700), 0);
-  EXPECT_EQ(ModeOf("/tmp/a"), 0750U);
-  EXPECT_EQ(ModeOf("/tmp/a/b"), 0700U);
+  EXPECT_EQ(ModeOf("/tmp/a"), S_IFDIR | 0750U);
+  EXPECT_EQ(ModeOf("/tmp/a/b"), S_IFDIR | 0700U);
 }
 
 TEST(FSMkdirPTest, FailsWhereAFileIsInTheWay) {

@@ -5,7 +5,7 @@
 
 #include <string>
 
-#include "containers.h"
+#include "platform/containers.h"
 #include "platform/error.h"
 #include "platform/owned.h"
 

@@ -11,17 +11,17 @@
 
 #include <chrono>
 #include <functional>
-#include <random>
 #include <string>
 #include <thread>
 #include <vector>
 
-#include "containers.h"
+#include "platform/containers.h"
 #include "platform/error.h"
 #include "platform/key_value.h"
 #include "platform/owned.h"
 #include "support/appliance.h"
 #include "support/calls.h"
+#include "support/random.h"
 
 using namespace quendel::test;
 using testing::ElementsAre;
@@ -161,18 +161,18 @@ TEST(FileSetKeyValueTest, QuotesWhatWouldReadBackOtherwise) {
 }
 
 TEST(FileSetKeyValueTest, ReadsBackEveryValueThatItWrote) {
-  const unsigned seed = std::random_device()();
-  SCOPED_TRACE("seed " + std::to_string(seed));
-  std::mt19937 random(seed);
+  Random random;
   const std::string favourites = "\"\\\n\r\t =#;[]n";
   WriteFile(kPath, "# kept\nbefore=1\n");
   for (int round = 0; round < 3000; ++round) {
     std::string value;
-    for (auto length = random() % 12; length > 0; --length) {
-      value += random() % 3 == 0 ? static_cast<char>(random() % 255 + 1)
-                                 : favourites[random() % favourites.size()];
+    for (int length = random.Below(12); length > 0; --length) {
+      value +=
+          random.OneIn(3)
+              ? static_cast<char>(random.Below(255) + 1)
+              : favourites[static_cast<size_t>(random.Below(static_cast<int>(favourites.size())))];
     }
-    const std::string key = "key" + std::to_string(random() % 3);
+    const std::string key = "key" + std::to_string(random.Below(3));
     ASSERT_EQ(Set(key, value), 1);
     ASSERT_EQ(Get(key), value);
     platform::OwnedHash hash(8);
@@ -482,16 +482,14 @@ TEST(FileSetKeyValueTest, ShowsReadersTheOldOrTheNewFileOnly) {
 
 TEST(FileSetKeyValueTest, LeavesTheOldOrTheNewFileWhenKilled) {
   WriteFile(kPath, "kept=1\ntext=" + Letters('A') + "\n");
-  const unsigned seed = std::random_device()();
-  SCOPED_TRACE("seed " + std::to_string(seed));
-  std::mt19937 random(seed);
+  Random random;
   for (int round = 0; round < 150; ++round) {
     const pid_t writer = InChild([] {
       for (int i = 0;; ++i) {
         Set("text", Letters(i % 2 == 0 ? 'B' : 'A'));
       }
     });
-    std::this_thread::sleep_for(std::chrono::microseconds(random() % 3000));
+    std::this_thread::sleep_for(std::chrono::microseconds(random.Below(3000)));
     kill(writer, SIGKILL);
     ASSERT_TRUE(WIFSIGNALED(StatusOf(writer)));
     ASSERT_TRUE(IsOneOfTheLetters(Get("text")));

@@ -9,7 +9,7 @@
 #include <cstring>
 #include <string>
 
-#include "containers.h"
+#include "platform/containers.h"
 #include "platform/error.h"
 #include "platform/owned.h"
 #include "support/appliance.h"

@@ -8,12 +8,11 @@
 
 #include <chrono>
 #include <map>
-#include <random>
 #include <string>
 #include <thread>
 #include <vector>
 
-#include "containers.h"
+#include "platform/containers.h"
 #include "platform/error.h"
 #include "platform/key_value.h"
 #include "platform/owned.h"

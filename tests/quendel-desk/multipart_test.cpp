@@ -9,8 +9,8 @@
 
 #include "quendel.h"
 #include "support/appliance.h"
+#include "support/multipart.h"
 #include "support/server.h"
-#include "transport/multipart.h"
 
 using namespace quendel::test;
 using quendeldesk::BoundaryOf;

@@ -14,8 +14,9 @@
 #include <functional>
 #include <thread>
 
-#include "run_quendelctl.h"
+#include "quendelctl/run_quendelctl.h"
 #include "support/appliance.h"
+#include "support/device.h"
 #include "support/server.h"
 
 using namespace quendel::test;
@@ -45,17 +46,9 @@ std::string LogSettings(const std::string& name, const std::string& path, const 
          "\ntar_log_inode=\"\"\nlast_byte=0\ntotal_byte=" + offset + "\ninode=" + inode + "\n";
 }
 
-void InstallLog(const std::string& name, const std::string& text) {
+void InstallLogOf(const std::string& name, const std::string& text) {
   WriteFile("/volume1/" + name, text);
-  WriteFile("/usr/arvo/etc/quendel/quendel.log." + name,
-            LogSettings(name, "/volume1/" + name, "\"\"", "\"\"", "\"\""));
-}
-
-void InstallProgram(const std::string& name, const std::string& script) {
-  WriteFile("/volume1/" + name, "#!/bin/sh\n" + script + "\n");
-  ASSERT_EQ(chmod(("/volume1/" + name).c_str(), 0700), 0);
-  WriteFile("/usr/arvo/etc/quendel/quendel.udc." + name,
-            "name=" + name + "\npath=/volume1/" + name + "\nlast_hash=\"\"\n");
+  InstallLog(name, "/volume1/" + name);
 }
 
 std::vector<std::string> RunFiles() {
@@ -173,8 +166,8 @@ class CollectorsTest : public testing::Test {
  protected:
   void SetUp() override {
     SetIdentity();
-    InstallLog("messages", "first\nsecond\n");
-    InstallProgram("raid", "echo '{\"disks\":4}'");
+    InstallLogOf("messages", "first\nsecond\n");
+    InstallUdc("raid", "echo '{\"disks\":4}'");
   }
 };
 
@@ -229,7 +222,7 @@ TEST_F(CollectCommandTest, TellsTheArchiveOfThisRunAmongOthers) {
 }
 
 TEST_F(CollectCommandTest, PrintsJson) {
-  InstallLog("second", "x\n");
+  InstallLogOf("second", "x\n");
   WriteFile("/volume1/second.1", "old\n");
   ASSERT_EQ(Shell("xz /volume1/second.1").status, 0);
   const Output output = Quendelctl({"collect", "--keep", "--json"});
@@ -300,7 +293,7 @@ TEST_F(CollectCommandTest, KeepsWhatTheServerDeclined) {
 }
 
 TEST_F(CollectCommandTest, LeavesTheDirectoriesOfOtherRunsAlone) {
-  InstallProgram("raid", "mkdir /tmp/quendel_other; echo '{}'");
+  InstallUdc("raid", "mkdir /tmp/quendel_other; echo '{}'");
   const Output output = Quendelctl({"collect"});
   EXPECT_EQ(output.status, 0);
   EXPECT_EQ(output.out,
@@ -373,9 +366,9 @@ TEST_F(CollectCommandTest, LeavesTheGroupOfItsCallerAlone) {
 }
 
 TEST_F(CollectCommandTest, EndsTheCollectorsOfAWorkerThatWasKilled) {
-  InstallProgram("raid",
-                 "echo $$ > /volume1/collector.pid; sleep 0.5; "
-                 "kill -KILL $(cut -d' ' -f4 /proc/$PPID/stat); exec sleep 1000");
+  InstallUdc("raid",
+             "echo $$ > /volume1/collector.pid; sleep 0.5; "
+             "kill -KILL $(cut -d' ' -f4 /proc/$PPID/stat); exec sleep 1000");
   const std::string settings = ReadFile(kRaid);
   const Output output = Quendelctl({"collect"});
   EXPECT_EQ(output.status, 1);
@@ -387,7 +380,7 @@ TEST_F(CollectCommandTest, EndsTheCollectorsOfAWorkerThatWasKilled) {
 }
 
 TEST_F(CollectCommandTest, EndsEverythingWhenInterrupted) {
-  InstallProgram("raid", kNeverEnds);
+  InstallUdc("raid", kNeverEnds);
   const std::string settings = ReadFile(kMessages);
   for (const char* name : {"TERM", "HUP"}) {
     RemoveFile(kPidFile);
@@ -402,13 +395,13 @@ TEST_F(CollectCommandTest, EndsEverythingWhenInterrupted) {
 }
 
 TEST_F(CollectCommandTest, EndsACollectorThatIgnoresSigterm) {
-  InstallProgram("raid", std::string("trap '' TERM HUP\n") + kNeverEnds);
+  InstallUdc("raid", std::string("trap '' TERM HUP\n") + kNeverEnds);
   EXPECT_EQ(CollectAndSignal("TERM").status, 1);
   EXPECT_TRUE(CollectorEnds());
 }
 
 TEST_F(CollectCommandTest, KeepsWhatAnInterruptedRunHas) {
-  InstallProgram("raid", kNeverEnds);
+  InstallUdc("raid", kNeverEnds);
   const Output output = CollectAndSignal("TERM", "--keep --json");
   EXPECT_EQ(output.status, 1);
   ASSERT_THAT(RunFiles(), SizeIs(1));
@@ -419,7 +412,7 @@ TEST_F(CollectCommandTest, KeepsWhatAnInterruptedRunHas) {
 }
 
 TEST_F(CollectCommandTest, GoesOnWhenASignalIsIgnored) {
-  InstallProgram("raid", "echo $$ > /volume1/collector.pid; sleep 1; echo '{}'");
+  InstallUdc("raid", "echo $$ > /volume1/collector.pid; sleep 1; echo '{}'");
   const Output output = Shell(
       "env --ignore-signal=HUP --ignore-signal=CHLD $quendelctl collect & tool=$!; "
       "while [ ! -s " +
@@ -429,7 +422,7 @@ TEST_F(CollectCommandTest, GoesOnWhenASignalIsIgnored) {
 }
 
 TEST_F(CollectCommandTest, ShowsALineForEachPhase) {
-  InstallLog("large", "x");
+  InstallLogOf("large", "x");
   ASSERT_EQ(Shell("head -c 3000000 /dev/urandom | base64 > /volume1/large").status, 0);
   Answer({.body = R"({"success":true})", .delay_ms = 500});
   const Output output = Quendelctl({"collect", "--send"});
@@ -441,8 +434,8 @@ TEST_F(CollectCommandTest, ShowsALineForEachPhase) {
 }
 
 TEST_F(CollectCommandTest, RedrawsOneLineOnATerminal) {
-  InstallLog("idle", "");
-  InstallProgram("raid", "sleep 1; echo nonsense");
+  InstallLogOf("idle", "");
+  InstallUdc("raid", "sleep 1; echo nonsense");
   const Terminal terminal = OnTerminal({"collect"});
   EXPECT_EQ(terminal.status, 0);
   EXPECT_THAT(terminal.shown, ContainsRegex("\rcollecting: [0-2] of 2 logs, [0-9]+ B, 0 s\x1b\\[K\r"
@@ -453,7 +446,7 @@ TEST_F(CollectCommandTest, RedrawsOneLineOnATerminal) {
 }
 
 TEST_F(CollectCommandTest, KeepsLogLinesApartFromTheLineOnATerminal) {
-  InstallProgram("raid", "sleep 1; echo nonsense");
+  InstallUdc("raid", "sleep 1; echo nonsense");
   const Terminal terminal = OnTerminal({"collect"});
   EXPECT_THAT(terminal.shown, HasSubstr("\x1b[K\r\x1b[Kquendelctl: quendel_collect_udc:"));
 }
@@ -471,7 +464,7 @@ TEST_F(CollectCommandTest, ShowsPlainLinesOnADumbTerminal) {
 }
 
 TEST_F(CollectCommandTest, EndsEverythingAtTheInterruptKey) {
-  InstallProgram("raid", kNeverEnds);
+  InstallUdc("raid", kNeverEnds);
   for (const char* key : {"\x03", "\x1c"}) {
     RemoveFile(kPidFile);
     const Terminal terminal = OnTerminal({"collect"}, 80, "xterm", [key](int master) {
@@ -544,7 +537,7 @@ TEST(PerfCommandTest, RejectsWhatIsNoCount) {
 TEST_F(ConfCommandTest, ListsEachStateInWords) {
   const std::string folder = "/usr/arvo/etc/quendel/";
   RemoveFile(kRaid);
-  InstallLog("aa_never", "12345");
+  InstallLogOf("aa_never", "12345");
   struct stat status = {};
   WriteFile("/volume1/log", "1234567890");
   ASSERT_EQ(stat("/volume1/log", &status), 0);
@@ -603,9 +596,9 @@ TEST_F(ConfCommandTest, ListsEachStateInWords) {
 
 TEST_F(ConfCommandTest, ListsPrograms) {
   RemoveFile(kMessages);
-  InstallProgram("locked", "true");
+  InstallUdc("locked", "true");
   ASSERT_EQ(chmod("/volume1/locked", 0600), 0);
-  InstallProgram("nowhere", "true");
+  InstallUdc("nowhere", "true");
   RemoveFile("/volume1/nowhere");
   WriteFile(kRaid, std::string("name=raid\npath=/volume1/raid\nlast_hash=") + kHash + "\n");
   const Output output = Quendelctl({"conf", "list"});
@@ -704,7 +697,7 @@ TEST_F(ConfCommandTest, SaysWhatCouldNotBeReset) {
 }
 
 TEST_F(ConfCommandTest, RejectsANameThatIsNotOneCollector) {
-  InstallProgram("messages", "true");
+  InstallUdc("messages", "true");
   const std::string settings = ReadFile(kMessages);
   ExpectUsageError({"conf", "reset", "messages"},
                    "NAME: messages can be quendel.log.messages or quendel.udc.messages");

@@ -1,7 +1,7 @@
 // heartbeat, event and progress: what they send, what they print and how they end.
 #include <gmock/gmock.h>
 
-#include "run_quendelctl.h"
+#include "quendelctl/run_quendelctl.h"
 #include "support/appliance.h"
 #include "support/server.h"
 

@@ -2,7 +2,7 @@
 #include <gmock/gmock.h>
 
 #include "quendel.h"
-#include "run_quendelctl.h"
+#include "quendelctl/run_quendelctl.h"
 #include "support/appliance.h"
 #include "support/server.h"
 

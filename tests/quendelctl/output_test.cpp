@@ -1,7 +1,7 @@
 // What the output is safe from, and what becomes of it when it cannot be written.
 #include <gmock/gmock.h>
 
-#include "run_quendelctl.h"
+#include "quendelctl/run_quendelctl.h"
 #include "support/appliance.h"
 #include "support/server.h"
 

@@ -7,8 +7,9 @@
 
 #include <set>
 
-#include "run_quendelctl.h"
+#include "quendelctl/run_quendelctl.h"
 #include "support/appliance.h"
+#include "support/device.h"
 #include "support/server.h"
 
 using namespace quendel::test;
@@ -21,7 +22,7 @@ using testing::StartsWith;
 namespace {
 
 constexpr char kConf[] = "/usr/arvo/etc/quendel.remote.conf";
-constexpr char kConfFolder[] = "/usr/arvo/etc";
+constexpr char kSettingsFolder[] = "/usr/arvo/etc";
 constexpr char kKeyFile[] = "/tmp/staff.pub";
 constexpr char kAuthorizedKeys[] = "/run/quendelhome/.ssh/authorized_keys";
 constexpr char kTool[] = "/usr/arvo/sbin/arvocloudserviceauth";
@@ -54,12 +55,6 @@ std::set<std::string> Names(const char* folder) {
   return names;
 }
 
-// Replaces the authentication tool by one of this script.
-void UseTool(const std::string& script) {
-  WriteFile(kTool, "#!/bin/sh\n" + script + "\n");
-  ASSERT_EQ(chmod(kTool, 0755), 0);
-}
-
 }  // namespace
 
 TEST_F(RemoteCreateCommandTest, OpensASession) {
@@ -89,10 +84,10 @@ TEST_F(RemoteCreateCommandTest, PrintsJson) {
 }
 
 TEST_F(RemoteCreateCommandTest, LeavesOnlyTheSessionFileAndThatForRoot) {
-  std::set<std::string> names = Names(kConfFolder);
+  std::set<std::string> names = Names(kSettingsFolder);
   EXPECT_EQ(Shell("umask 0; $quendelctl remote create support /tmp/staff.pub").status, 0);
   names.insert("quendel.remote.conf");
-  EXPECT_EQ(Names(kConfFolder), names);
+  EXPECT_EQ(Names(kSettingsFolder), names);
   struct stat status = {};
   ASSERT_EQ(stat(kConf, &status), 0);
   EXPECT_EQ(status.st_mode, S_IFREG | 0600U);
@@ -100,7 +95,7 @@ TEST_F(RemoteCreateCommandTest, LeavesOnlyTheSessionFileAndThatForRoot) {
 
 TEST_F(RemoteCreateCommandTest, RefusesASecondSession) {
   WriteFile(kConf, "remote_account=first\n");
-  const std::set<std::string> names = Names(kConfFolder);
+  const std::set<std::string> names = Names(kSettingsFolder);
   const Output text = Quendelctl({"remote", "create", "support", kKeyFile});
   EXPECT_EQ(text.status, 1);
   EXPECT_EQ(text.out, kNotOpened);
@@ -110,7 +105,7 @@ TEST_F(RemoteCreateCommandTest, RefusesASecondSession) {
   EXPECT_EQ(json.status, 1);
   EXPECT_EQ(json.out, "{\"stop_sshd\":false,\"success\":false,\"user\":\"support\"}\n");
   EXPECT_EQ(ReadFile(kConf), "remote_account=first\n");
-  EXPECT_EQ(Names(kConfFolder), names);
+  EXPECT_EQ(Names(kSettingsFolder), names);
   EXPECT_FALSE(AccountExists("support"));
   EXPECT_FALSE(Exists("/run/quendelhome"));
 }
@@ -133,7 +128,7 @@ TEST_F(RemoteCreateCommandTest, RefusesALinkInThePlaceOfTheFile) {
 }
 
 TEST_F(RemoteCreateCommandTest, FailsWithoutTheFolderForItsFile) {
-  RemoveFile(kConfFolder);
+  RemoveFile(kSettingsFolder);
   const Output output = Quendelctl({"remote", "create", "support", kKeyFile});
   EXPECT_EQ(output.status, 1);
   EXPECT_EQ(output.out, kNotOpened);
@@ -319,7 +314,7 @@ TEST_F(RemoteKeyCommandTest, ShowsTheKeyOfTheTool) {
 }
 
 TEST_F(RemoteKeyCommandTest, PrintsTheBytesAsTheyAre) {
-  UseTool(R"(printf 'a\0\033[2J\377')");
+  InstallTool(kTool, R"(printf 'a\0\033[2J\377')");
   const Output text = Quendelctl({"remote", "key"});
   EXPECT_EQ(text.status, 0);
   EXPECT_EQ(text.out, std::string("a\0\x1b[2J\xff", 7));
@@ -329,21 +324,21 @@ TEST_F(RemoteKeyCommandTest, PrintsTheBytesAsTheyAre) {
 }
 
 TEST_F(RemoteKeyCommandTest, LeavesOutTheZeroBytesAtTheEnd) {
-  UseTool(R"(printf 'a\0b\0\0')");
+  InstallTool(kTool, R"(printf 'a\0b\0\0')");
   EXPECT_EQ(Quendelctl({"remote", "key"}).out, std::string("a\0b", 3));
   EXPECT_EQ(Quendelctl({"remote", "key", "--json"}).out,
             "{\"key\":\"a\\u0000b\",\"key_hex\":\"610062\",\"success\":true}\n");
 }
 
 TEST_F(RemoteKeyCommandTest, DoesNotLetTheKeyActOnATerminal) {
-  UseTool(R"(printf 'a\tb\n\033[2J')");
+  InstallTool(kTool, R"(printf 'a\tb\n\033[2J')");
   const Output output = Shell("script -qec \"$quendelctl remote key\" /dev/null");
   EXPECT_EQ(output.status, 0);
   EXPECT_EQ(output.out, "a\tb\r\n\\x1b[2J");
 }
 
 TEST_F(RemoteKeyCommandTest, KeepsTheKeyOutOfTheLog) {
-  UseTool("printf secret; exit 1");
+  InstallTool(kTool, "printf secret; exit 1");
   const Output shown = Quendelctl({"remote", "key"});
   EXPECT_EQ(shown.out, "secret");
   const Output full = Shell("$quendelctl remote key >/dev/full");
@@ -352,7 +347,7 @@ TEST_F(RemoteKeyCommandTest, KeepsTheKeyOutOfTheLog) {
 }
 
 TEST_F(RemoteKeyCommandTest, FailsWithoutAKey) {
-  UseTool("true");
+  InstallTool(kTool, "true");
   const Output text = Quendelctl({"remote", "key"});
   EXPECT_EQ(text.status, 1);
   EXPECT_EQ(text.out, "There is no session key.\n");
@@ -363,9 +358,9 @@ TEST_F(RemoteKeyCommandTest, FailsWithoutAKey) {
 }
 
 TEST_F(RemoteKeyCommandTest, ShowsNoKeyThatIsCut) {
-  UseTool("head -c 65535 /dev/zero | tr '\\0' k");
+  InstallTool(kTool, "head -c 65535 /dev/zero | tr '\\0' k");
   EXPECT_EQ(Quendelctl({"remote", "key"}).out, std::string(65535, 'k'));
-  UseTool("head -c 65536 /dev/zero | tr '\\0' k");
+  InstallTool(kTool, "head -c 65536 /dev/zero | tr '\\0' k");
   const Output output = Quendelctl({"remote", "key"});
   EXPECT_EQ(output.status, 1);
   EXPECT_EQ(output.out, "The session key is too long.\n");

@@ -1,5 +1,5 @@
 // Runs the real quendelctl and keeps what it printed.
-#include "run_quendelctl.h"
+#include "quendelctl/run_quendelctl.h"
 
 #include <fcntl.h>
 #include <gtest/gtest.h>

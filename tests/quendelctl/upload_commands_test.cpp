@@ -1,10 +1,10 @@
 // upload: the request that it builds, what is sent, what it prints and how it ends.
 #include <gmock/gmock.h>
 
-#include "run_quendelctl.h"
+#include "quendelctl/run_quendelctl.h"
 #include "support/appliance.h"
+#include "support/multipart.h"
 #include "support/server.h"
-#include "transport/multipart.h"
 
 using namespace quendel::test;
 using testing::HasSubstr;
@@ -32,14 +32,6 @@ Json::Value Descriptions() {
   const std::vector<Part> parts = requests.empty() ? std::vector<Part>() : Parts(requests[0]);
   EXPECT_FALSE(parts.empty());
   return parts.empty() ? Json::Value() : FromJsonLine(parts.back().body + "\n");
-}
-
-std::vector<std::string> RequestLines() {
-  std::vector<std::string> lines;
-  for (const Request& request : Requests()) {
-    lines.push_back(request.line);
-  }
-  return lines;
 }
 
 }  // namespace

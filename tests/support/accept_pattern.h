@@ -1,6 +1,6 @@
 // A server that takes some connections and refuses others.
-#ifndef SUPPORT_ACCEPT_PATTERN_H_
-#define SUPPORT_ACCEPT_PATTERN_H_
+#ifndef TESTS_SUPPORT_ACCEPT_PATTERN_H_
+#define TESTS_SUPPORT_ACCEPT_PATTERN_H_
 
 #include <cstddef>
 #include <string>
@@ -27,4 +27,4 @@ class AcceptPattern {
 
 }  // namespace quendel::test
 
-#endif  // SUPPORT_ACCEPT_PATTERN_H_
+#endif  // TESTS_SUPPORT_ACCEPT_PATTERN_H_

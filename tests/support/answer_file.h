@@ -1,6 +1,6 @@
 // How a test hands its answers to the server: as files.
-#ifndef SUPPORT_ANSWER_FILE_H_
-#define SUPPORT_ANSWER_FILE_H_
+#ifndef TESTS_SUPPORT_ANSWER_FILE_H_
+#define TESTS_SUPPORT_ANSWER_FILE_H_
 
 #include <string>
 
@@ -21,4 +21,4 @@ bool AnswerFromText(const std::string& text, ScriptedAnswer& answer);
 
 }  // namespace quendel::test
 
-#endif  // SUPPORT_ANSWER_FILE_H_
+#endif  // TESTS_SUPPORT_ANSWER_FILE_H_

@@ -1,7 +1,7 @@
 // The files of the appliance that a test runs on. Each test has an appliance of its own, so it
 // writes the real paths and leaves them as they are.
-#ifndef SUPPORT_APPLIANCE_H_
-#define SUPPORT_APPLIANCE_H_
+#ifndef TESTS_SUPPORT_APPLIANCE_H_
+#define TESTS_SUPPORT_APPLIANCE_H_
 
 #include <map>
 #include <string>
@@ -31,4 +31,4 @@ void SetIdentity();
 
 }  // namespace quendel::test
 
-#endif  // SUPPORT_APPLIANCE_H_
+#endif  // TESTS_SUPPORT_APPLIANCE_H_

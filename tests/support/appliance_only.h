@@ -1,6 +1,6 @@
 // For programs that change the machine they run on.
-#ifndef SUPPORT_APPLIANCE_ONLY_H_
-#define SUPPORT_APPLIANCE_ONLY_H_
+#ifndef TESTS_SUPPORT_APPLIANCE_ONLY_H_
+#define TESTS_SUPPORT_APPLIANCE_ONLY_H_
 
 #include <string>
 
@@ -12,4 +12,4 @@ void EndUnlessOnAppliance(const std::string& command);
 
 }  // namespace quendel::test
 
-#endif  // SUPPORT_APPLIANCE_ONLY_H_
+#endif  // TESTS_SUPPORT_APPLIANCE_ONLY_H_

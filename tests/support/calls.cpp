@@ -3,10 +3,8 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <cstdlib>
 #include <cstring>
 #include <filesystem>
-#include <limits>
 #include <mutex>
 #include <system_error>
 
@@ -16,26 +14,6 @@
 #include "support/wrap.h"
 
 namespace quendel::test {
-
-struct CallRule {
-  bool IsAbout(bool inPlatform, const Texts& given);
-  bool Decides() const;
-
-  Wrapped* function;
-  bool library = true;    // is about the library's calls
-  bool platform = false;  // about the platform's
-  std::vector<testing::Matcher<std::string>> arguments;
-  std::function<bool()> holds;
-  int nth = 0;   // 0: each
-  int seen = 0;  // calls that it was about but for their position
-
-  std::function<void()> before;
-  bool returns = false;
-  long result = 0;
-  int error = 0;
-  size_t most = std::numeric_limits<size_t>::max();
-  std::any replacement;
-};
 
 namespace {
 
@@ -103,7 +81,6 @@ bool CallRule::Decides() const {
 On::On(const char* function) : rule_(std::make_shared<CallRule>()) {
   const std::lock_guard<std::mutex> lock(guard);
   Wrapped& known = Known(function);
-  rule_->function = &known;
   if (known.rules == nullptr) {
     known.rules = new std::vector<std::shared_ptr<CallRule>>;
   }
@@ -244,49 +221,20 @@ WrappedCall::~WrappedCall() {
   platformDepth -= !unseen_ && function_.IsPlatformOperation() ? 1 : 0;
 }
 
-void WrappedCall::Judge(const Texts& arguments) {
+const CallRule* WrappedCall::Judge(const Texts& arguments) {
   const std::lock_guard<std::mutex> lock(guard);
   if (function_.recorded && !in_platform_) {
     Records().Add(Joined(arguments));
   }
   if (function_.rules == nullptr) {
-    return;
+    return nullptr;
   }
   for (const auto& rule : *function_.rules) {
     if (rule->IsAbout(in_platform_, arguments) && rule->Decides()) {
       rule_ = rule;
     }
   }
-}
-
-void WrappedCall::Before() const {
-  if (rule_ != nullptr && rule_->before) {
-    const Acting acting(function_);
-    rule_->before();
-  }
-}
-
-bool WrappedCall::returns() const {
-  return rule_ != nullptr && rule_->returns;
-}
-
-long WrappedCall::result() const {
-  errno = rule_->error == 0 ? errno : rule_->error;
-  return rule_->result;
-}
-
-size_t WrappedCall::most() const {
-  return rule_ == nullptr ? std::numeric_limits<size_t>::max() : rule_->most;
-}
-
-const std::any& WrappedCall::replacement() const {
-  static const std::any none;
-  return rule_ == nullptr ? none : rule_->replacement;
-}
-
-void WrappedCall::RefuseReplacement() const {
-  Require(false, std::string(function_.name) + " is replaced by a function with another signature");
-  abort();
+  return rule_.get();
 }
 
 }  // namespace quendel::test

@@ -21,8 +21,8 @@
 //
 // A forked child goes on with a copy of counts and rules; its calls are not counted in the parent.
 // Records are shared.
-#ifndef SUPPORT_CALLS_H_
-#define SUPPORT_CALLS_H_
+#ifndef TESTS_SUPPORT_CALLS_H_
+#define TESTS_SUPPORT_CALLS_H_
 
 #include <gmock/gmock.h>
 
@@ -110,4 +110,4 @@ int SleptSeconds();
 
 }  // namespace quendel::test
 
-#endif  // SUPPORT_CALLS_H_
+#endif  // TESTS_SUPPORT_CALLS_H_

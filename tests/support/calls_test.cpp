@@ -217,7 +217,7 @@ TEST(OnTest, TellsThePlatformsCallsFromTheLibrarys) {
 TEST(OnDeathTest, RefusesAnotherSignature) {
   struct stat status = {};
   On("stat").Replace([](const char*) { return 0; });
-  EXPECT_DEATH(stat("/tmp", &status), "stat is replaced by a function with another signature");
+  EXPECT_DEATH(stat("/tmp", &status), "a function is replaced by one with another signature");
 }
 
 TEST(RestoreTest, ForgetsTheRulesOfOneFunction) {

@@ -1,6 +1,6 @@
 // A list of texts that a process and the children it forks write to together.
-#ifndef SUPPORT_JOURNAL_H_
-#define SUPPORT_JOURNAL_H_
+#ifndef TESTS_SUPPORT_JOURNAL_H_
+#define TESTS_SUPPORT_JOURNAL_H_
 
 #include <atomic>
 #include <cstddef>
@@ -28,4 +28,4 @@ class Journal {
 
 }  // namespace quendel::test
 
-#endif  // SUPPORT_JOURNAL_H_
+#endif  // TESTS_SUPPORT_JOURNAL_H_

@@ -1,6 +1,6 @@
 // JSON in tests.
-#ifndef SUPPORT_JSON_H_
-#define SUPPORT_JSON_H_
+#ifndef TESTS_SUPPORT_JSON_H_
+#define TESTS_SUPPORT_JSON_H_
 
 #include <json/value.h>
 
@@ -20,4 +20,4 @@ inline Json::Value JsonOf(const std::string& text) {
 
 }  // namespace quendel::test
 
-#endif  // SUPPORT_JSON_H_
+#endif  // TESTS_SUPPORT_JSON_H_

@@ -1,7 +1,7 @@
 // What the library logged: each syslog call of the test program and of the children it forks lands
 // here instead of in the system's log.
-#ifndef SUPPORT_LOG_H_
-#define SUPPORT_LOG_H_
+#ifndef TESTS_SUPPORT_LOG_H_
+#define TESTS_SUPPORT_LOG_H_
 
 #include <gmock/gmock.h>
 
@@ -34,4 +34,4 @@ testing::Matcher<LogLine> Logged(const testing::Matcher<std::string>& unit,
 
 }  // namespace quendel::test
 
-#endif  // SUPPORT_LOG_H_
+#endif  // TESTS_SUPPORT_LOG_H_

@@ -1,6 +1,6 @@
 // Tells the kit's own work from that of what is tested, which it goes on in the middle of.
-#ifndef SUPPORT_OWN_WORK_H_
-#define SUPPORT_OWN_WORK_H_
+#ifndef TESTS_SUPPORT_OWN_WORK_H_
+#define TESTS_SUPPORT_OWN_WORK_H_
 
 namespace quendel::test {
 
@@ -21,4 +21,4 @@ class OwnWork {
 
 }  // namespace quendel::test
 
-#endif  // SUPPORT_OWN_WORK_H_
+#endif  // TESTS_SUPPORT_OWN_WORK_H_

@@ -1,7 +1,7 @@
 // Replies that a server which nobody authenticated may send. Every function that posts is run
 // through all of them.
-#ifndef SUPPORT_REPLIES_H_
-#define SUPPORT_REPLIES_H_
+#ifndef TESTS_SUPPORT_REPLIES_H_
+#define TESTS_SUPPORT_REPLIES_H_
 
 #include <ostream>
 #include <string>
@@ -25,4 +25,4 @@ const std::vector<HostileReply>& HostileReplies();
 
 }  // namespace quendel::test
 
-#endif  // SUPPORT_REPLIES_H_
+#endif  // TESTS_SUPPORT_REPLIES_H_

@@ -1,6 +1,6 @@
 // For what the kit itself cannot do without.
-#ifndef SUPPORT_REQUIRE_H_
-#define SUPPORT_REQUIRE_H_
+#ifndef TESTS_SUPPORT_REQUIRE_H_
+#define TESTS_SUPPORT_REQUIRE_H_
 
 #include <cstdio>
 #include <cstdlib>
@@ -22,4 +22,4 @@ inline void Require(bool holds, const std::string& otherwise) {
 
 }  // namespace quendel::test
 
-#endif  // SUPPORT_REQUIRE_H_
+#endif  // TESTS_SUPPORT_REQUIRE_H_

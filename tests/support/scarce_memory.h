@@ -1,6 +1,6 @@
 // Allocations that fail on demand.
-#ifndef SUPPORT_SCARCE_MEMORY_H_
-#define SUPPORT_SCARCE_MEMORY_H_
+#ifndef TESTS_SUPPORT_SCARCE_MEMORY_H_
+#define TESTS_SUPPORT_SCARCE_MEMORY_H_
 
 #include <functional>
 
@@ -21,4 +21,4 @@ void WithEachAllocationFailing(const std::function<int()>& work,
 
 }  // namespace quendel::test
 
-#endif  // SUPPORT_SCARCE_MEMORY_H_
+#endif  // TESTS_SUPPORT_SCARCE_MEMORY_H_

@@ -1,6 +1,6 @@
 // One answer of the scripted HTTPS server.
-#ifndef SUPPORT_SCRIPTED_ANSWER_H_
-#define SUPPORT_SCRIPTED_ANSWER_H_
+#ifndef TESTS_SUPPORT_SCRIPTED_ANSWER_H_
+#define TESTS_SUPPORT_SCRIPTED_ANSWER_H_
 
 #include <cstddef>
 #include <string>
@@ -27,4 +27,4 @@ struct ScriptedAnswer {
 
 }  // namespace quendel::test
 
-#endif  // SUPPORT_SCRIPTED_ANSWER_H_
+#endif  // TESTS_SUPPORT_SCRIPTED_ANSWER_H_

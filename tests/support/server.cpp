@@ -1,6 +1,8 @@
 // The test's side of the scripted HTTPS server: answers go to it, and requests come back, as files.
 #include "support/server.h"
 
+#include <gtest/gtest.h>
+
 #include <algorithm>
 #include <cstdio>
 #include <filesystem>
@@ -72,6 +74,20 @@ void Answer(const ScriptedAnswer& answer) {
   char name[16];
   snprintf(name, sizeof name, "%08d", ++queued);
   Hand(Folder() / "answers" / name, TextFromAnswer(answer));
+}
+
+std::vector<std::string> RequestLines() {
+  std::vector<std::string> lines;
+  for (const Request& request : Requests()) {
+    lines.push_back(request.line);
+  }
+  return lines;
+}
+
+std::string RequestLine() {
+  const std::vector<std::string> lines = RequestLines();
+  EXPECT_EQ(lines.size(), 1U);
+  return lines.at(0);
 }
 
 std::vector<std::string> RequestFiles() {

@@ -1,7 +1,7 @@
 // The scripted HTTPS server on port 51790 of the test's appliance. It is a process of its own
 // (test_server), so only tests that are registered with SERVER have it.
-#ifndef SUPPORT_SERVER_H_
-#define SUPPORT_SERVER_H_
+#ifndef TESTS_SUPPORT_SERVER_H_
+#define TESTS_SUPPORT_SERVER_H_
 
 #include <string>
 #include <vector>
@@ -26,6 +26,10 @@ struct Request {
 // Returns the requests that arrived whole, in the order in which their connections were opened.
 std::vector<Request> Requests();
 
+// Returns the first line of each, and of the only one so far.
+std::vector<std::string> RequestLines();
+std::string RequestLine();
+
 // Returns the files that hold their bytes, for requests that are too large to be read into memory.
 std::vector<std::string> RequestFiles();
 
@@ -35,4 +39,4 @@ void UseCertificate(const std::string& kind);
 
 }  // namespace quendel::test
 
-#endif  // SUPPORT_SERVER_H_
+#endif  // TESTS_SUPPORT_SERVER_H_

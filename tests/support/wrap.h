@@ -5,15 +5,17 @@
 //   QUENDEL_WRAP_CPP(linker's name, "its name in tests", result type, (parameters), arguments...);
 //   QUENDEL_WRAP_BY_HAND(name, "its name in tests"); and __wrap_name() written out, which does its
 //       work by PassCall(). For functions with a variable number of arguments.
-#ifndef SUPPORT_WRAP_H_
-#define SUPPORT_WRAP_H_
+#ifndef TESTS_SUPPORT_WRAP_H_
+#define TESTS_SUPPORT_WRAP_H_
 
+#include <gmock/gmock.h>
 #include <json/value.h>
 
 #include <algorithm>
 #include <any>
 #include <atomic>
 #include <cerrno>
+#include <cstdint>
 #include <functional>
 #include <memory>
 #include <string>
@@ -22,10 +24,30 @@
 
 #include "base/json_text.h"
 #include "support/own_work.h"
+#include "support/require.h"
 
 namespace quendel::test {
 
-struct CallRule;
+// What comes of some of a function's calls: see On.
+struct CallRule {
+  // Counts a call that it is about but for its position. Returns whether it is about this one.
+  bool IsAbout(bool inPlatform, const std::vector<std::string>& given);
+  bool Decides() const;
+
+  bool library = true;    // is about the library's calls
+  bool platform = false;  // about the platform's
+  std::vector<testing::Matcher<std::string>> arguments;
+  std::function<bool()> holds;
+  int nth = 0;  // 0: each
+  int seen = 0;
+
+  std::function<void()> before;
+  bool returns = false;
+  long result = 0;
+  int error = 0;
+  size_t most = SIZE_MAX;
+  std::any replacement;
+};
 
 // A wrapped function. These exist before anything runs, as some functions are called very early,
 // and counting needs no memory.
@@ -105,19 +127,11 @@ class WrappedCall {
   WrappedCall(const WrappedCall&) = delete;
   WrappedCall& operator=(const WrappedCall&) = delete;
 
-  // Whether there is more to do than to make the call.
+  // Whether there may be more to do than to make the call.
   bool watched() const { return watched_; }
 
-  // Keeps the arguments, and looks for the rule about this call.
-  void Judge(const Texts& arguments);
-
-  // What comes of the call. Before() first.
-  void Before() const;
-  bool returns() const;
-  long result() const;  // sets errno, too
-  size_t most() const;
-  const std::any& replacement() const;
-  [[noreturn]] void RefuseReplacement() const;
+  // Keeps the arguments. Returns the rule about this call, or null.
+  const CallRule* Judge(const Texts& arguments);
 
  private:
   Wrapped& function_;
@@ -161,30 +175,32 @@ template <typename Signature, typename Real, typename... Arguments>
 auto PassCall(Wrapped& function, Real real, Arguments&&... arguments) {
   using Result = typename std::function<Signature>::result_type;
   WrappedCall call(function);
-  if (!call.watched()) {
-    return real(arguments...);
-  }
-  {
+  const CallRule* rule = nullptr;
+  if (call.watched()) {
     const OwnWork ownWork;
     const int savedErrno = errno;
     Texts texts;
     (Show(texts, arguments), ...);
-    call.Judge(texts);
+    rule = call.Judge(texts);
     errno = savedErrno;
   }
-  call.Before();
-  if (call.returns()) {
-    return ResultFrom<Result>(call.result());
+  if (rule == nullptr) {
+    return real(arguments...);
   }
-  if (call.replacement().has_value()) {
-    const auto* replacement = std::any_cast<std::function<Signature>>(&call.replacement());
-    if (replacement == nullptr) {
-      call.RefuseReplacement();
-    }
-    const Acting acting(function);
+  const Acting acting(function);
+  if (rule->before) {
+    rule->before();
+  }
+  if (rule->returns) {
+    errno = rule->error == 0 ? errno : rule->error;
+    return ResultFrom<Result>(rule->result);
+  }
+  if (rule->replacement.has_value()) {
+    const auto* replacement = std::any_cast<std::function<Signature>>(&rule->replacement);
+    Require(replacement != nullptr, "a function is replaced by one with another signature");
     return (*replacement)(arguments...);
   }
-  (ShortenTo(call.most(), arguments), ...);
+  (ShortenTo(rule->most, arguments), ...);
   return real(arguments...);
 }
 
@@ -210,4 +226,4 @@ auto PassCall(Wrapped& function, Real real, Arguments&&... arguments) {
   QUENDEL_WRAP_CPP(name, #name, Result, parameters, ##__VA_ARGS__); \
   static_assert(sizeof(static_cast<decltype(&__real_##name)>(&name)) != 0)
 
-#endif  // SUPPORT_WRAP_H_
+#endif  // TESTS_SUPPORT_WRAP_H_

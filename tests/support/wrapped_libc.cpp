@@ -39,6 +39,7 @@ QUENDEL_WRAP(fopen, FILE*, (const char* path, const char* mode), path, mode);
 QUENDEL_WRAP(fork, pid_t, ());
 QUENDEL_WRAP(fstat, int, (int fd, struct stat* status), Fd(fd), status);
 QUENDEL_WRAP(fsync, int, (int fd), Fd(fd));
+QUENDEL_WRAP(fputs, int, (const char* text, FILE* stream), text, stream);
 QUENDEL_WRAP(ftruncate, int, (int fd, off_t size), Fd(fd), size);
 QUENDEL_WRAP(gethostbyname, hostent*, (const char* name), name);
 QUENDEL_WRAP(kill, int, (pid_t process, int number), process, number);

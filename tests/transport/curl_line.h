@@ -1,6 +1,6 @@
 // What both posts log of a transfer that failed.
-#ifndef TRANSPORT_CURL_LINE_H_
-#define TRANSPORT_CURL_LINE_H_
+#ifndef TESTS_TRANSPORT_CURL_LINE_H_
+#define TESTS_TRANSPORT_CURL_LINE_H_
 
 #include <curl/curl.h>
 
@@ -14,4 +14,4 @@ inline std::string CurlLine(CURLcode code) {
 
 }  // namespace quendel::test
 
-#endif  // TRANSPORT_CURL_LINE_H_
+#endif  // TESTS_TRANSPORT_CURL_LINE_H_

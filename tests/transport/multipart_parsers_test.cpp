@@ -7,8 +7,8 @@
 #include "quendel.h"
 #include "support/appliance.h"
 #include "support/json.h"
+#include "support/multipart.h"
 #include "support/server.h"
-#include "transport/multipart.h"
 
 using namespace quendel::test;
 

@@ -1,5 +1,4 @@
 // The connect test: pairs of successes within six attempts.
-#include <dirent.h>
 #include <gmock/gmock.h>
 #include <netdb.h>
 #include <sys/socket.h>
@@ -10,6 +9,7 @@
 #include "support/accept_pattern.h"
 #include "support/appliance.h"
 #include "support/calls.h"
+#include "support/device.h"
 #include "support/log.h"
 
 using namespace quendel::test;
@@ -23,17 +23,6 @@ namespace {
 
 constexpr char kUnit[] = "util.cpp";
 constexpr char kRefused[] = "connect to a socket failed, errno: Connection refused";
-
-// The open descriptors of this process.
-int OpenDescriptors() {
-  int count = 0;
-  DIR* folder = opendir("/proc/self/fd");
-  while (readdir(folder) != nullptr) {
-    ++count;
-  }
-  closedir(folder);
-  return count;
-}
 
 // One run of the test against a server that accepts (a) and refuses (r) in this order.
 struct Outcome {

@@ -12,9 +12,9 @@
 #include "support/calls.h"
 #include "support/json.h"
 #include "support/log.h"
+#include "support/multipart.h"
 #include "support/server.h"
 #include "transport/curl_line.h"
-#include "transport/multipart.h"
 
 using namespace quendel::test;
 using testing::_;

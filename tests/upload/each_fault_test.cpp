@@ -15,6 +15,7 @@
 #include "quendel.h"
 #include "support/appliance.h"
 #include "support/calls.h"
+#include "support/device.h"
 #include "support/json.h"
 #include "support/log.h"
 #include "support/server.h"
@@ -78,10 +79,6 @@ Texts FilesAt(const Texts& places) {
     }
   }
   return {files.begin(), files.end()};
-}
-
-auto OpenDescriptors() {
-  return std::distance(fs::directory_iterator("/proc/self/fd"), fs::directory_iterator());
 }
 
 // Has the call fail during the operation and compares.
@@ -231,18 +228,12 @@ int UploadBoth() {
                                       {"file_type":"debug.dat","file_uuid":"u2"}])"));
 }
 
-void SetTool(const std::string& path, const std::string& script) {
-  RemoveFile(path);
-  WriteFile(path, "#!/bin/sh\n" + script + "\n");
-  chmod(path.c_str(), 0755);
-}
-
 // The debug archive needs no real zip here.
 void PrepareUpload() {
   SetIdentity();
   WriteFile(kDump, "what the program held in memory");
-  SetTool("/usr/arvo/bin/arvomsg_collector2", "echo facts > \"$1/facts.txt\"");
-  SetTool("/usr/bin/zip", "echo archive > /tmp/quendel/debugdat.zip");
+  InstallTool("/usr/arvo/bin/arvomsg_collector2", "echo facts > \"$1/facts.txt\"");
+  InstallTool("/usr/bin/zip", "echo archive > /tmp/quendel/debugdat.zip");
 }
 
 // ---- The end of a support session.

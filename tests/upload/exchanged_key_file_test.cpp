@@ -7,6 +7,8 @@
 
 #include "quendel.h"
 #include "support/appliance.h"
+#include "support/calls.h"
+#include "support/device.h"
 
 using namespace quendel::test;
 
@@ -17,14 +19,6 @@ constexpr char kKeyFile[] = "/run/quendelhome/.ssh/authorized_keys";
 constexpr char kOpenedKeyFile[] = "/run/quendelhome/taken/authorized_keys";
 constexpr char kSecret[] = "/volume1/secret";
 
-bool exchange = false;
-
-mode_t ModeOf(const char* path) {
-  struct stat status = {};
-  EXPECT_EQ(lstat(path, &status), 0) << path;
-  return status.st_mode & 07777U;
-}
-
 // What a process of the support account, which owns the home, can do there at any moment.
 void ExchangeKeyFile() {
   EXPECT_EQ(rename(kSshDir, "/run/quendelhome/taken"), 0);
@@ -34,25 +28,19 @@ void ExchangeKeyFile() {
 
 }  // namespace
 
-// The library writes the key by this call, and sets the mode next.
-extern "C" int __real_fputs(const char* text, FILE* stream);
-extern "C" int __wrap_fputs(const char* text, FILE* stream) {
-  const int written = __real_fputs(text, stream);
-  if (exchange) {
-    exchange = false;
-    ExchangeKeyFile();
-  }
-  return written;
-}
-
 TEST(SupportAccountUserCreateTest, SetsTheModeOfTheFileItWroteAndOfNoOther) {
   WriteFile(kSecret, "root's own");
   ASSERT_EQ(chmod(kSecret, 0600), 0);
   umask(077);
-  exchange = true;
+  // The library writes the key by this call, and sets the mode next.
+  On("fputs").Nth(1).Replace([](const char* text, FILE* stream) {
+    const int written = fputs(text, stream);
+    ExchangeKeyFile();
+    return written;
+  });
   EXPECT_EQ(QUENDELSupportAccountUserCreate("support", "key"), 0);
-  ASSERT_FALSE(exchange);
-  EXPECT_EQ(ModeOf(kSecret), 0600U);
-  EXPECT_EQ(ModeOf(kOpenedKeyFile), 0644U);
+  ASSERT_EQ(Calls("fputs"), 1);
+  EXPECT_EQ(ModeOf(kSecret), S_IFREG | 0600U);
+  EXPECT_EQ(ModeOf(kOpenedKeyFile), S_IFREG | 0644U);
   EXPECT_EQ(ReadFile(kOpenedKeyFile), "key");
 }

@@ -1,13 +1,11 @@
 // Memory runs out at each allocation in turn. Whichever it is, nothing is thrown at the caller, and
 // a failure is one of the documented ones, with its line in the log.
 #include <gmock/gmock.h>
-#include <sys/stat.h>
-
-#include <filesystem>
 
 #include "base/json_text.h"
 #include "quendel.h"
 #include "support/appliance.h"
+#include "support/device.h"
 #include "support/log.h"
 #include "support/scarce_memory.h"
 
@@ -22,12 +20,6 @@ using testing::HasSubstr;
 using testing::MatchesRegex;
 using testing::Not;
 using testing::SizeIs;
-
-namespace fs = std::filesystem;
-
-auto OpenDescriptors() {
-  return std::distance(fs::directory_iterator("/proc/self/fd"), fs::directory_iterator());
-}
 
 struct Outcome {
   int result;
@@ -67,12 +59,6 @@ std::vector<Outcome> FailEachAllocation(
   }
 }
 
-void SetTool(const std::string& path, const std::string& script) {
-  RemoveFile(path);
-  WriteFile(path, "#!/bin/sh\n" + script + "\n");
-  chmod(path.c_str(), 0755);
-}
-
 const Json::Value& Request() {
   static const Json::Value request = [] {
     Json::Value files;
@@ -91,8 +77,8 @@ TEST(OutOfMemoryTest, FailsAnUploadAsDocumented) {
   const auto prepare = [] {
     SetIdentity();
     WriteFile("/var/crash/@app.core", "dump");
-    SetTool("/usr/arvo/bin/arvomsg_collector2", "echo facts > \"$1/facts.txt\"");
-    SetTool("/usr/bin/zip", "echo archive > /tmp/quendel/debugdat.zip");
+    InstallTool("/usr/arvo/bin/arvomsg_collector2", "echo facts > \"$1/facts.txt\"");
+    InstallTool("/usr/bin/zip", "echo archive > /tmp/quendel/debugdat.zip");
   };
   const std::vector<Outcome> outcomes = FailEachAllocation(
       prepare, [] { return QUENDELUploadFile(17, QUENDEL_ACT_PROGRESS_RUN, Request()); });
@@ -155,7 +141,7 @@ TEST(OutOfMemoryTest, FailsTheSupportAccountAsDocumented) {
 }
 
 TEST(OutOfMemoryTest, FailsTheSessionKeyAsDocumented) {
-  FailEachAllocation([] { SetTool("/usr/arvo/sbin/arvocloudserviceauth", "echo key"); },
+  FailEachAllocation([] { InstallTool("/usr/arvo/sbin/arvocloudserviceauth", "echo key"); },
                      [] {
                        char key[32] = {};
                        return QUENDELGetRemoteSessionKey(key, sizeof key - 1);

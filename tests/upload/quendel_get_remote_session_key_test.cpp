@@ -8,6 +8,7 @@
 #include "quendel.h"
 #include "support/appliance.h"
 #include "support/calls.h"
+#include "support/device.h"
 #include "support/log.h"
 
 using namespace quendel::test;
@@ -19,15 +20,10 @@ namespace {
 constexpr char kUnit[] = "util";
 constexpr char kTool[] = "/usr/arvo/sbin/arvocloudserviceauth";
 
-void SetTool(const std::string& script) {
-  WriteFile(kTool, "#!/bin/sh\n" + script + "\n");
-  chmod(kTool, 0755);
-}
-
 }  // namespace
 
 TEST(GetRemoteSessionKeyTest, AsksTheAuthenticationTool) {
-  SetTool("printf 'key-1'");
+  InstallTool(kTool, "printf 'key-1'");
   Record("ALIBCPopen");
   char key[32] = {};
   EXPECT_EQ(QUENDELGetRemoteSessionKey(key, sizeof key - 1), 0);
@@ -37,7 +33,7 @@ TEST(GetRemoteSessionKeyTest, AsksTheAuthenticationTool) {
 }
 
 TEST(GetRemoteSessionKeyTest, GivesTheBytesAsTheyCome) {
-  SetTool(R"(printf ' k\000\377\n\n')");
+  InstallTool(kTool, R"(printf ' k\000\377\n\n')");
   char key[8];
   std::fill(std::begin(key), std::end(key), '#');
   EXPECT_EQ(QUENDELGetRemoteSessionKey(key, sizeof key), 0);
@@ -45,7 +41,7 @@ TEST(GetRemoteSessionKeyTest, GivesTheBytesAsTheyCome) {
 }
 
 TEST(GetRemoteSessionKeyTest, CutsALongerKeyAtTheSize) {
-  SetTool("printf 'abcdefgh'");
+  InstallTool(kTool, "printf 'abcdefgh'");
   char key[8];
   std::fill(std::begin(key), std::end(key), '#');
   EXPECT_EQ(QUENDELGetRemoteSessionKey(key, 4), 0);
@@ -53,14 +49,14 @@ TEST(GetRemoteSessionKeyTest, CutsALongerKeyAtTheSize) {
 }
 
 TEST(GetRemoteSessionKeyTest, WaitsForAToolThatWritesInPieces) {
-  SetTool("printf 'ab'; /bin/sleep 0.1; printf 'cd'");
+  InstallTool(kTool, "printf 'ab'; /bin/sleep 0.1; printf 'cd'");
   char key[8] = {};
   EXPECT_EQ(QUENDELGetRemoteSessionKey(key, sizeof key - 1), 0);
   EXPECT_STREQ(key, "abcd");
 }
 
 TEST(GetRemoteSessionKeyTest, DoesNotLookAtTheExitStatus) {
-  SetTool("printf 'key'; exit 9");
+  InstallTool(kTool, "printf 'key'; exit 9");
   char key[8] = {};
   EXPECT_EQ(QUENDELGetRemoteSessionKey(key, sizeof key - 1), 0);
   EXPECT_STREQ(key, "key");
@@ -76,7 +72,7 @@ TEST(GetRemoteSessionKeyTest, FailsWithoutTheTool) {
 }
 
 TEST(GetRemoteSessionKeyTest, FailsWhenTheToolPrintsNothing) {
-  SetTool("exit 0");
+  InstallTool(kTool, "exit 0");
   char key[8] = "before";
   EXPECT_EQ(QUENDELGetRemoteSessionKey(key, sizeof key - 1), -1);
   EXPECT_STREQ(key, "before");
@@ -85,7 +81,7 @@ TEST(GetRemoteSessionKeyTest, FailsWhenTheToolPrintsNothing) {
 }
 
 TEST(GetRemoteSessionKeyTest, LogsNoMoreOfTheBufferThanItHolds) {
-  SetTool("exit 0");
+  InstallTool(kTool, "exit 0");
   char key[8];
   std::fill(std::begin(key), std::end(key), '#');
   EXPECT_EQ(QUENDELGetRemoteSessionKey(key, 4), -1);
@@ -93,7 +89,7 @@ TEST(GetRemoteSessionKeyTest, LogsNoMoreOfTheBufferThanItHolds) {
 }
 
 TEST(GetRemoteSessionKeyTest, ReadsNothingIntoABufferWithoutRoom) {
-  SetTool("printf 'key'");
+  InstallTool(kTool, "printf 'key'");
   char key[4] = {'#', '#', '#', '#'};
   for (const int size : {0, -1}) {
     ClearLog();
@@ -104,7 +100,7 @@ TEST(GetRemoteSessionKeyTest, ReadsNothingIntoABufferWithoutRoom) {
 }
 
 TEST(GetRemoteSessionKeyTest, ClosesTheToolInEveryCase) {
-  SetTool("printf 'key'");
+  InstallTool(kTool, "printf 'key'");
   char key[8] = {};
   EXPECT_EQ(QUENDELGetRemoteSessionKey(key, sizeof key - 1), 0);
   EXPECT_EQ(Calls("ALIBCPclose"), 1);

@@ -26,14 +26,6 @@ constexpr char kUnit[] = "quendel_remote_close";
 constexpr char kApi[] = "ARVO::APIRunner::Exec";
 constexpr char kConf[] = "/usr/arvo/etc/quendel.remote.conf";
 
-std::vector<std::string> RequestLines() {
-  std::vector<std::string> lines;
-  for (const Request& request : Requests()) {
-    lines.push_back(request.line);
-  }
-  return lines;
-}
-
 class RemoteCloseTest : public testing::Test {
  protected:
   RemoteCloseTest() { AnswerTheApi(R"({"success":true})"); }

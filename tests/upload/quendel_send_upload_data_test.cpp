@@ -10,9 +10,9 @@
 #include "support/calls.h"
 #include "support/json.h"
 #include "support/log.h"
+#include "support/multipart.h"
 #include "support/replies.h"
 #include "support/server.h"
-#include "transport/multipart.h"
 
 using namespace quendel::test;
 using testing::_;
@@ -33,12 +33,6 @@ QUENDELSendDataParam_t Item(const std::string& path, uint64_t timestamp = 1, std
   item.path = path;
   item.fileuuid = std::move(uuid);
   return item;
-}
-
-// The request line of the only request so far.
-std::string RequestLine() {
-  EXPECT_EQ(Requests().size(), 1U);
-  return Requests().at(0).line;
 }
 
 // What the last part of the only request so far says of the files.

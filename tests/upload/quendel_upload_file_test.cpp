@@ -4,15 +4,16 @@
 
 #include <algorithm>
 #include <iterator>
-#include <random>
 #include <string>
 
 #include "base/json_text.h"
 #include "quendel.h"
 #include "support/appliance.h"
 #include "support/calls.h"
+#include "support/device.h"
 #include "support/json.h"
 #include "support/log.h"
+#include "support/random.h"
 #include "support/server.h"
 
 using namespace quendel::test;
@@ -52,8 +53,9 @@ class UploadFileTest : public testing::Test {
   void SetUp() override {
     SetIdentity();
     WriteFile(kDump, "what the program held in memory");
-    Tool("/usr/arvo/bin/arvomsg_collector2", "echo facts > \"$1/facts.txt\"");
-    Tool("/usr/bin/zip", "while [ $# -gt 2 ]; do shift; done; tar -cf \"$1\" \"$2\" 2>/dev/null");
+    InstallTool("/usr/arvo/bin/arvomsg_collector2", "echo facts > \"$1/facts.txt\"");
+    InstallTool("/usr/bin/zip",
+                "while [ $# -gt 2 ]; do shift; done; tar -cf \"$1\" \"$2\" 2>/dev/null");
     StartOver();
   }
 
@@ -62,12 +64,6 @@ class UploadFileTest : public testing::Test {
     ResetCalls();
     Record("ALIBCExec");
     Record("ALIBCExecl");
-  }
-
-  static void Tool(const std::string& path, const std::string& script) {
-    RemoveFile(path);
-    WriteFile(path, "#!/bin/sh\n" + script + "\n");
-    chmod(path.c_str(), 0755);
   }
 
   static int Upload(const Json::Value& files) {
@@ -79,14 +75,6 @@ using Step = testing::Matcher<LogLine>;
 
 Step GivenUp(const std::string& type, const std::string& path) {
   return Logged(kUnit, "Prepare uploaded file failed [" + type + "]:[" + path + "]");
-}
-
-std::vector<std::string> RequestLines() {
-  std::vector<std::string> lines;
-  for (const Request& request : Requests()) {
-    lines.push_back(request.line);
-  }
-  return lines;
 }
 
 std::string Xz(const std::string& dump) {
@@ -301,7 +289,7 @@ class AnyRequest {
   }
 
  private:
-  int Pick(int choices) { return std::uniform_int_distribution<int>(0, choices - 1)(random_); }
+  int Pick(int choices) { return random_.Below(choices); }
 
   Json::Value Element() {
     Json::Value element(Json::objectValue);
@@ -360,7 +348,7 @@ class AnyRequest {
     return text + (Pick(4) == 0 ? "" : ".core");
   }
 
-  std::mt19937 random_;
+  Random random_;
 };
 
 bool IsDumpPath(std::string path) {
@@ -388,7 +376,6 @@ bool IsDumpPath(std::string path) {
 TEST_F(UploadFileTest, GivesTheToolsNoOtherPathWhateverIsAskedFor) {
   int compressed = 0;
   for (unsigned int seed = 0; seed < 20000; ++seed) {
-    SCOPED_TRACE("seed " + std::to_string(seed));
     StartOver();
     On("ALIBCExec").Return(1);
     On("ALIBCExecl").Return(-1);
@@ -641,7 +628,7 @@ TEST_F(UploadFileTest, GivesTheDebugArchiveUpThatCouldNotBePacked) {
 }
 
 TEST_F(UploadFileTest, LooksOnlyWhetherThePackingCouldRun) {
-  Tool("/usr/bin/zip", "echo half > /tmp/quendel/debugdat.zip; exit 18");
+  InstallTool("/usr/bin/zip", "echo half > /tmp/quendel/debugdat.zip; exit 18");
   EXPECT_EQ(Upload(List({File("debug.dat", "")})), 0);
   EXPECT_THAT(Log(), IsEmpty());
   ASSERT_THAT(RequestLines(), ElementsAre(kUpload));
@@ -650,7 +637,7 @@ TEST_F(UploadFileTest, LooksOnlyWhetherThePackingCouldRun) {
 
 // As with a zip that does not know the options.
 TEST_F(UploadFileTest, FailsTheWholePostWithoutTheArchive) {
-  Tool("/usr/bin/zip", "exit 16");
+  InstallTool("/usr/bin/zip", "exit 16");
   EXPECT_EQ(Upload(List({File("coredump", kDump), File("debug.dat", "")})), -1);
   EXPECT_THAT(Log(),
               ElementsAre(Logged("quendel_post_file_to_server", HasSubstr("CURL Error(26): ")),

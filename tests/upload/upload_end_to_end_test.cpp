@@ -12,8 +12,8 @@
 #include "support/appliance.h"
 #include "support/json.h"
 #include "support/log.h"
+#include "support/multipart.h"
 #include "support/server.h"
-#include "transport/multipart.h"
 
 using namespace quendel::test;
 using testing::Contains;

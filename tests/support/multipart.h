@@ -1,6 +1,6 @@
 // Takes a captured multipart request apart.
-#ifndef TESTS_TRANSPORT_MULTIPART_H_
-#define TESTS_TRANSPORT_MULTIPART_H_
+#ifndef TESTS_SUPPORT_MULTIPART_H_
+#define TESTS_SUPPORT_MULTIPART_H_
 
 #include <ostream>
 #include <string>
@@ -32,4 +32,4 @@ std::vector<Part> Parts(const Request& request);
 
 }  // namespace quendel::test
 
-#endif  // TESTS_TRANSPORT_MULTIPART_H_
+#endif  // TESTS_SUPPORT_MULTIPART_H_

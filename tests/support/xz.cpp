@@ -1,5 +1,5 @@
 // The .xz format, without starting a program.
-#include "model/xz.h"
+#include "support/xz.h"
 
 #include <lzma.h>
 

@@ -1,6 +1,6 @@
 // The .xz format, without starting a program.
-#ifndef TESTS_MODEL_XZ_H_
-#define TESTS_MODEL_XZ_H_
+#ifndef TESTS_SUPPORT_XZ_H_
+#define TESTS_SUPPORT_XZ_H_
 
 #include <optional>
 #include <string>
@@ -14,4 +14,4 @@ std::optional<std::string> Unxz(const std::string& bytes);
 
 }  // namespace quendel::test
 
-#endif  // TESTS_MODEL_XZ_H_
+#endif  // TESTS_SUPPORT_XZ_H_

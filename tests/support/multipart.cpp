@@ -1,5 +1,5 @@
 // Takes a captured multipart request apart.
-#include "transport/multipart.h"
+#include "support/multipart.h"
 
 #include <gtest/gtest.h>
 #include <strings.h>
