@@ -19,6 +19,15 @@ install(TARGETS ${libraries} EXPORT quendel-targets
   LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR}
   ARCHIVE DESTINATION ${CMAKE_INSTALL_LIBDIR})
 install(DIRECTORY include/ DESTINATION ${CMAKE_INSTALL_INCLUDEDIR} FILES_MATCHING PATTERN "*.h")
+if(NOT QUENDEL_PLATFORM_LIBRARIES)
+  # In a folder of their own, which is named to the compiler, as they include each other by "platform/".
+  set(platform_include_dir ${CMAKE_INSTALL_INCLUDEDIR}/quendel-platform)
+  install(DIRECTORY src/platform/ DESTINATION ${platform_include_dir}/platform
+    FILES_MATCHING PATTERN "*.h" PATTERN standalone EXCLUDE)
+  foreach(library quendel-platform quendel-platform_static)
+    target_include_directories(${library} INTERFACE $<INSTALL_INTERFACE:${platform_include_dir}>)
+  endforeach()
+endif()
 
 install(EXPORT quendel-targets NAMESPACE quendel:: DESTINATION ${cmake_package_dir})
 write_basic_package_version_file(quendel-config-version.cmake COMPATIBILITY SameMajorVersion)
@@ -29,7 +38,11 @@ install(FILES cmake/quendel-config.cmake ${CMAKE_CURRENT_BINARY_DIR}/quendel-con
 # the name of a package would pull in what a static libcurl needs, and libcurl is a shared one here.
 set(private_libraries "")
 foreach(library IN LISTS platform_libraries)
-  if(NOT library MATCHES "^-|/")
+  # Where a library lies here says nothing about the machine that it is linked on.
+  if(library MATCHES "/")
+    get_filename_component(library ${library} NAME)
+    set(library -l:${library})
+  elseif(NOT library MATCHES "^-")
     set(library -l${library})
   endif()
   list(APPEND private_libraries ${library})
@@ -75,3 +88,15 @@ if(QUENDEL_BUILD_QUENDELD)
   install(FILES packaging/logrotate/firstaction.example
     DESTINATION ${CMAKE_INSTALL_DATADIR}/doc/quendel)
 endif()
+
+# The loader looks below /usr by itself. There a search path of one's own only gets in its way.
+set(files_with_rpath ${CMAKE_INSTALL_LIBDIR}/libquendel.so.${PROJECT_VERSION}
+  ${CMAKE_INSTALL_BINDIR}/quendelctl ${CMAKE_INSTALL_LIBEXECDIR}/quendel/quendel-worker)
+install(CODE "
+  if(CMAKE_INSTALL_PREFIX MATCHES \"^/usr/*$\")
+    foreach(file ${files_with_rpath})
+      if(EXISTS \"\$ENV{DESTDIR}/usr/\${file}\")
+        file(RPATH_REMOVE FILE \"\$ENV{DESTDIR}/usr/\${file}\")
+      endif()
+    endforeach()
+  endif()")
