@@ -31,11 +31,20 @@ void PrepareSignals() {
   signal(SIGCHLD, SIG_DFL);
 }
 
-// One daemon at a time: it holds the lock until it ends, however it ends.
+// One daemon at a time: it holds the lock until it ends, however it ends. One that is killed while it
+// starts a worker leaves the lock to that for a moment.
 bool TakeLock() {
+  constexpr int kTries = 20;
+  constexpr useconds_t kPauseMicroseconds = 50'000;
   mkdir("/run/quendel", 0755);
   const int file = open(kLockFile, O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600);
-  return file >= 0 && flock(file, LOCK_EX | LOCK_NB) == 0;
+  for (int attempt = 0; file >= 0 && attempt < kTries; ++attempt) {
+    if (flock(file, LOCK_EX | LOCK_NB) == 0) {
+      return true;
+    }
+    usleep(kPauseMicroseconds);
+  }
+  return false;
 }
 
 void OccupyStandardDescriptors() {
