@@ -21,7 +21,6 @@ namespace {
 
 constexpr char kSettingsFolder[] = "/usr/arvo/etc";
 constexpr Duration kSettingsSettle = std::chrono::milliseconds(200);
-constexpr Duration kStatusEvery = std::chrono::seconds(1);
 constexpr Duration kStopLimit = std::chrono::milliseconds(4500);
 constexpr Duration kWhyLimit = std::chrono::seconds(1);
 constexpr Duration kLastEventLimit = std::chrono::seconds(3);
@@ -87,7 +86,6 @@ Daemon::Daemon(Loop& loop, const DaemonOptions& options)
                  HandleControl(request, reply);
                }),
       look_timer_(loop, [this] { service_.Look(); }),
-      status_timer_(loop, [this] { WriteStatus(); }),
       stop_timer_(loop, [this] { loop_.Quit(); }),
       terminate_(loop, SIGTERM, [this] { Stop(); }),
       interrupt_(loop, SIGINT, [this] { Stop(); }),
@@ -150,8 +148,9 @@ void Daemon::ServiceChanged() {
   sessions_.Update();
   events_.Flush();
   actions_.Next();
-  if (!status_timer_.is_running()) {
-    status_timer_.Start(kStatusEvery);
+  if (!is_status_due_) {
+    is_status_due_ = true;
+    loop_.Soon([this] { WriteStatus(); });
   }
 }
 
@@ -261,6 +260,7 @@ Json::Value Daemon::History() {
 }
 
 void Daemon::WriteStatus() {
+  is_status_due_ = false;
   WriteStatusFile(Status());
 }
 

@@ -69,7 +69,6 @@ class Daemon {
   RotationWatch rotations_;
   Control control_;
   Timer look_timer_;
-  Timer status_timer_;
   Timer stop_timer_;
   SignalSource terminate_;
   SignalSource interrupt_;
@@ -77,6 +76,7 @@ class Daemon {
   int settings_watch_ = -1;
   std::unique_ptr<Readable> settings_readable_;
   bool may_talk_ = false;
+  bool is_status_due_ = false;
   bool is_stopping_ = false;
   const int64_t started_;
 };
