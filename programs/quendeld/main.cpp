@@ -31,8 +31,8 @@ void PrepareSignals() {
   signal(SIGCHLD, SIG_DFL);
 }
 
-// One daemon at a time: it holds the lock until it ends, however it ends. One that is killed while it
-// starts a worker leaves the lock to that for a moment.
+// One daemon at a time: it holds the lock until it ends, however it ends. One that is killed while
+// it starts a worker leaves the lock to that for a moment.
 bool TakeLock() {
   constexpr int kTries = 20;
   constexpr useconds_t kPauseMicroseconds = 50'000;
