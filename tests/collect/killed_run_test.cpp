@@ -6,7 +6,6 @@
 #include <unistd.h>
 
 #include <csignal>
-#include <cstdarg>
 #include <filesystem>
 #include <fstream>
 #include <functional>
@@ -82,19 +81,7 @@ void AwaitOrphanhood(pid_t parent) {
   }
 }
 
-// What the library's own call for the signal does instead, when a test says so.
-std::function<int()> deathSignal;
-
 }  // namespace
-
-extern "C" int __real_prctl(int option, ...);
-extern "C" int __wrap_prctl(int option, ...) {
-  va_list arguments;
-  va_start(arguments, option);
-  const unsigned long signal = va_arg(arguments, unsigned long);
-  va_end(arguments);
-  return deathSignal && option == PR_SET_PDEATHSIG ? deathSignal() : __real_prctl(option, signal);
-}
 
 TEST(KilledRunTest, TakesItsChildrenAlong) {
   InstallCollectors("while [ ! -e /tmp/end ]; do sleep 0.01; done");
@@ -109,10 +96,10 @@ TEST(KilledRunTest, LeavesNothingToChildrenThatHaveHardlyBegun) {
   StopTheClock();
   InstallCollectors();
   const pid_t run = StartRun([] {
-    deathSignal = [parent = getpid()] {
-      AwaitOrphanhood(parent);
-      return 0;
-    };
+    On("prctl")
+        .With(PR_SET_PDEATHSIG)
+        .Before([parent = getpid()] { AwaitOrphanhood(parent); })
+        .Return(0);
   });
   const Children children = AwaitChildren();
   Kill(run);
@@ -126,7 +113,7 @@ TEST(KilledRunTest, LeavesNothingToChildrenThatHaveHardlyBegun) {
 TEST(KilledRunTest, LetsNoChildStageForAnotherRun) {
   InstallCollectors();
   const pid_t run = StartRun([] {
-    deathSignal = [] { return 0; };
+    On("prctl").With(PR_SET_PDEATHSIG).Return(0);
     for (const std::string kind : {"udc", "log"}) {
       On(CollectorOf(kind)).Before([kind, parent = getpid()] {
         WriteFile("/tmp/begun-" + kind, "");

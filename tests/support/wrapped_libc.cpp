@@ -86,3 +86,17 @@ int __wrap_openat(int directory, const char* name, int flags, ...) {
   return quendel::test::PassCall<int(int, const char*, int, mode_t)>(
       wrapped_openat, __real_openat, Fd(directory), name, flags, mode);
 }
+
+// Its arguments depend on the option; those that tests care about have one number.
+QUENDEL_WRAP_BY_HAND(prctl, "prctl");
+extern "C" int __real_prctl(int option, ...);
+extern "C" int __wrap_prctl(int option, ...);
+int __wrap_prctl(int option, ...) {
+  va_list arguments;
+  va_start(arguments, option);
+  const unsigned long value = va_arg(arguments, unsigned long);
+  va_end(arguments);
+  return quendel::test::PassCall<int(int, unsigned long)>(
+      wrapped_prctl, [](int o, unsigned long v) { return __real_prctl(o, v, 0UL, 0UL, 0UL); },
+      option, value);
+}
