@@ -96,7 +96,7 @@ TEST_F(QuendeldActionsTest, OutlivesAThousandActionsAtOnce) {
   }
   Queue(actions);
   RunningDaemon daemon;
-  EXPECT_TRUE(Within(60, [&] { return Reports("1000/-1") == 1; }))
+  EXPECT_TRUE(Within(120, [&] { return Reports("1000/-1") == 1; }))
       << daemon.LogText().substr(0, 3000);
   EXPECT_TRUE(Within(10, [&] { return daemon.Status()["reports"] == 0; }));
   EXPECT_EQ(CountRequests("POST /action_progress/"), 1000);
