@@ -29,7 +29,7 @@ constexpr char kLog[] = "/var/log/arvo/one.log";
 
 int KillsWanted() {
   const char* text = getenv("QUENDELD_DAY_KILLS");
-  return text == nullptr ? 20 : atoi(text);
+  return text == nullptr ? 12 : atoi(text);
 }
 
 class Day {
