@@ -7,7 +7,9 @@
 #include <unistd.h>
 
 #include <csignal>
+#include <ctime>
 #include <filesystem>
+#include <fstream>
 #include <functional>
 #include <map>
 #include <random>
@@ -393,4 +395,192 @@ TEST_F(NeighbourTest, GetsNoLinesThroughWhatHePutIntoAnOpenRunDirectory) {
                                             std::string(kRunDir) + "/" + name)));
     ExpectOutsideUntouched();
   }
+}
+
+// ---- The attacker: whatever he plants, whenever he exchanges it.
+
+namespace {
+
+constexpr int kRounds = 40;  // QUENDEL_ATTACK_ROUNDS sets another number
+constexpr char kAttic[] = "/tmp/attic";
+constexpr char kRootsOwn[] = "/tmp/attic/of-root";
+
+// Lets go of what some kernels forbid in "/tmp" by themselves, where the machine lets it.
+class UnprotectedTmp {
+ public:
+  UnprotectedTmp() {
+    for (const std::string name : {"symlinks", "hardlinks", "fifos", "regular"}) {
+      const std::string path = "/proc/sys/fs/protected_" + name;
+      const std::string value = fs::exists(path) ? ReadFile(path) : "";
+      if (!value.empty() && value[0] != '0' && Set(path, "0")) {
+        before_[path] = value;
+      }
+    }
+  }
+  ~UnprotectedTmp() {
+    for (const auto& [path, value] : before_) {
+      Set(path, value);
+    }
+  }
+  UnprotectedTmp(const UnprotectedTmp&) = delete;
+  UnprotectedTmp& operator=(const UnprotectedTmp&) = delete;
+
+ private:
+  static bool Set(const std::string& path, const std::string& value) {
+    std::ofstream file(path);
+    return (file << value).flush().good();
+  }
+
+  std::map<std::string, std::string> before_;
+};
+
+// Every name that a run or an upload uses, with those of the run that starts now.
+std::vector<std::string> NamesToTake() {
+  std::vector<std::string> names = {kWorkRoot, "/tmp/quendel/coredump", "/tmp/quendel/debugdat",
+                                    kZip,      quendel::kLogUpdateFile, quendel::kUdcUpdateFile};
+  char stamp[64] = {};
+  const time_t now = time(nullptr);
+  struct tm local = {};
+  strftime(stamp, sizeof stamp, "/tmp/quendel_%Y%m%d_%H%M%S_0", localtime_r(&now, &local));
+  for (const char* below :
+       {"", ".tar.xz", "/log", "/udc", "/perf", "/log/messages", "/udc/udc.result"}) {
+    names.push_back(std::string(stamp) + below);
+  }
+  return names;
+}
+
+void PlantAnything(const std::string& path, std::minstd_rand& random) {
+  const char* const targets[] = {kHome, kSecret, "/volume1", kVictimConf, "/volume1/none"};
+  switch (random() % 6) {
+    case 0:
+      mkdir(path.c_str(), 0777);
+      break;
+    case 1:
+    case 2:
+      symlink(targets[random() % 5], path.c_str());
+      break;
+    case 3:
+      mkfifo(path.c_str(), 0666);
+      break;
+    case 4:
+      std::ofstream(path) << kForged;
+      break;
+    default:
+      link(kRootsOwn, path.c_str());
+      break;
+  }
+}
+
+// Reads an archive that is not his. Only a finding is left behind, in his own directory.
+void TryToRead(const std::string& path) {
+  const int file = open(path.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK);
+  struct stat status = {};
+  if (file >= 0 && fstat(file, &status) == 0 && status.st_uid != kNeighbour &&
+      S_ISREG(status.st_mode)) {
+    std::ofstream(std::string(kAttic) + "/read") << path << "\n";
+  }
+  close(file);
+}
+
+// Goes on until he is killed.
+[[noreturn]] void Attack() {
+  if (setgid(kNeighbour) != 0 || setuid(kNeighbour) != 0) {
+    _exit(1);
+  }
+  umask(0);
+  std::minstd_rand random(static_cast<unsigned>(getpid()));
+  for (;;) {
+    for (const std::string& name : NamesToTake()) {
+      if (fs::path(name).extension() == ".xz") {
+        TryToRead(name);
+      }
+      const std::string away = std::string(kAttic) + "/" + std::to_string(random() % 50);
+      rename(name.c_str(), away.c_str());
+      PlantAnything(name, random);
+    }
+  }
+}
+
+pid_t StartAttacker() {
+  const pid_t attacker = fork();
+  if (attacker == 0) {
+    Attack();
+  }
+  return attacker;
+}
+
+// What a round leaves, root's and the neighbour's, goes; the last name of a file of root's that the
+// neighbour could move about stays.
+void ClearTmp() {
+  for (const auto& entry : fs::directory_iterator("/tmp")) {
+    if (entry.path().filename().string().rfind("quendel", 0) == 0) {
+      std::error_code ignored;
+      fs::remove_all(entry.path(), ignored);
+    }
+  }
+}
+
+// Files of root's in directories of the neighbour's: what root was made to write.
+std::vector<std::string> RootsFilesInTheAttic() {
+  std::vector<std::string> found;
+  for (const auto& entry : fs::recursive_directory_iterator(kAttic)) {
+    struct stat status = {};
+    lstat(entry.path().c_str(), &status);
+    if (status.st_uid == 0 && entry.path() != kRootsOwn && status.st_nlink == 1) {
+      found.push_back(entry.path());
+    }
+  }
+  return found;
+}
+
+}  // namespace
+
+TEST_F(NeighbourTest, GetsNothingHoweverFastHeIs) {
+  const UnprotectedTmp unprotected;
+  const char* const asked = getenv("QUENDEL_ATTACK_ROUNDS");
+  const int rounds = asked == nullptr ? kRounds : std::stoi(asked);
+  ASSERT_EQ(mkdir(kAttic, 0777), 0);
+  ASSERT_EQ(chmod(kAttic, 0777), 0);
+  Own(kAttic);
+  // What he cannot write to himself: somebody else's home.
+  for (const auto& entry : fs::recursive_directory_iterator(kHome)) {
+    ASSERT_EQ(chown(entry.path().c_str(), kNeighbour + 1, kNeighbour + 1), 0);
+  }
+  ASSERT_EQ(chown(kHome, kNeighbour + 1, kNeighbour + 1), 0);
+  outside_ = Outside();
+  int good = 0;
+  for (int round = 0; round < rounds; ++round) {
+    SCOPED_TRACE("round " + std::to_string(round));
+    ClearTmp();
+    WriteFile(kRootsOwn, kForged);
+    ASSERT_EQ(chmod(kRootsOwn, 0600), 0);
+    const pid_t attacker = StartAttacker();
+    usleep(static_cast<useconds_t>(round % 5) * 500);
+    if (round % 3 == 0) {
+      const mode_t mask = umask(0);  // a chmod could follow what he puts there
+      mkdir(kWorkRoot, 0777);
+      umask(mask);
+    }
+    const Ending ending = InAGroupOfItsOwn([] {
+      signal(SIGTERM, SIG_IGN);
+      On("sleep").Before(AwaitAnyChild);
+      const int collected = QUENDELStartCollect(1, 0, Json::Value());
+      Upload("coredump");
+      Upload("debug.dat");
+      return collected;
+    });
+    EXPECT_EQ(ending.signal, 0) << "nothing waits for him";
+    good += ending.result == 0 ? 1 : 0;
+    kill(attacker, SIGKILL);
+    ASSERT_EQ(waitpid(attacker, nullptr, 0), attacker);
+    ASSERT_EQ(Outside(), outside_);
+    ASSERT_FALSE(Exists(std::string(kAttic) + "/read")) << ReadFile(std::string(kAttic) + "/read");
+    ASSERT_THAT(RootsFilesInTheAttic(), IsEmpty());
+    ASSERT_EQ(ReadFile(kRootsOwn), kForged);
+    ASSERT_EQ(ModeOf(kRootsOwn), S_IFREG | 0600U);
+  }
+  for (const Request& request : Requests()) {
+    ASSERT_THAT(request.body, Not(HasSubstr(kSecretText)));
+  }
+  RecordProperty("runs_that_succeeded", good);
 }
