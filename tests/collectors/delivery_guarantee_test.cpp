@@ -411,7 +411,54 @@ TEST(DeliveryGuaranteeTest, LinesAreLostOfASecondRunThatTheFirstOneCommits) {
   EXPECT_FALSE(ArrivesLater("lost"));
 }
 
+// ---- Taken for a continuation, by a part of a line ----
+
+TEST(DeliveryGuaranteeTest, LinesAreLostBeforeALineThatEndsInTheLastLine) {
+  InstallCollected("one\ntwo\n");
+  Rewrite("los:two\nthree\n");
+  EXPECT_FALSE(ArrivesLater("los:two"));
+  EXPECT_TRUE(HasArrived("three"));
+}
+
+TEST(DeliveryGuaranteeTest, LinesAreLostOfACopyTruncatedLogThatBeginsWithItsFirstLineAgain) {
+  InstallCollected("banner\n");
+  AppendFile(kLog, "lost\n");
+  CopyTruncate(kLog);
+  AppendFile(kLog, "banner\nnext\n");
+  EXPECT_FALSE(ArrivesLater("lost"));
+  EXPECT_TRUE(HasArrived("next"));
+}
+
+TEST(DeliveryGuaranteeTest, LinesAreLostOfALogWhosePathDoesNotFit) {
+  const std::string folder = "/tmp/" + std::string(200, 'f');
+  const std::string log = folder + "/" + std::string(60, 'n');
+  fs::create_directories(folder);
+  InstallLog("m", log);
+  WriteFile(log, "lost\n");
+  Deliver();
+  EXPECT_FALSE(HasArrived("lost"));
+}
+
 // ---- Late, but not lost ----
+
+TEST(DeliveryGuaranteeTest, LinesAreLostOfALateLogThatIsEmptied) {
+  InstallCollected("");
+  AppendFile(kLog, "lost\n");
+  Deliver();
+  EXPECT_FALSE(HasArrived("lost"));
+  Rewrite("two\n");
+  EXPECT_FALSE(ArrivesLater("lost"));
+}
+
+TEST(DeliveryGuaranteeTest, LinesAreLateAfterAnInterruptedReset) {
+  InstallCollected("one\n");
+  On("ALIBCFileSetKeyValue").Nth(5).Return(-1);  // the inode number stays
+  EXPECT_EQ(QUENDELResetLogConf(kConf.c_str()), -1);
+  ResetCalls();
+  EXPECT_FALSE(ArrivesLater("later 3"));
+  EXPECT_EQ(QUENDELResetLogConf(kConf.c_str()), 0);
+  EXPECT_TRUE(ArrivesLater("later 3"));
+}
 
 TEST(DeliveryGuaranteeTest, LinesAreLateOfALogThatWasFirstCollectedEmpty) {
   InstallCollected("");
