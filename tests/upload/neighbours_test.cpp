@@ -498,6 +498,7 @@ void TryToRead(const std::string& path) {
       rename(name.c_str(), away.c_str());
       PlantAnything(name, random);
     }
+    usleep(static_cast<useconds_t>(random() % 2 * (random() % 20000)));  // so that some last
   }
 }
 
