@@ -62,6 +62,10 @@ if(QUENDEL_BUILD_QUENDELCTL)
   set_target_properties(quendelctl PROPERTIES INSTALL_RPATH "$ORIGIN/${libraries_from_programs}")
   install(TARGETS quendelctl RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR})
   install(FILES docs/man/quendelctl.1 DESTINATION ${CMAKE_INSTALL_MANDIR}/man1)
+  install(FILES programs/quendelctl/completions/quendelctl
+    DESTINATION ${CMAKE_INSTALL_DATADIR}/bash-completion/completions)
+  install(FILES programs/quendelctl/completions/_quendelctl
+    DESTINATION ${CMAKE_INSTALL_DATADIR}/zsh/site-functions)
 endif()
 if(QUENDEL_BUILD_DESK)
   install(TARGETS quendel-desk RUNTIME DESTINATION ${CMAKE_INSTALL_BINDIR})

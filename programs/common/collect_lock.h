@@ -45,6 +45,10 @@ class CollectLock {
   // Waits until it is free, however long that takes, and takes it.
   Result Wait() { return Lock(true); }
 
+  // Makes this process the one that others are told of, where it was forked by the one that took
+  // it.
+  void TakeOver() const { WriteHolder(); }
+
   // After kHeld: who had it then.
   const LockHolder& holder() const { return holder_; }
 

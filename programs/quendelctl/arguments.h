@@ -17,8 +17,8 @@ int ReadNumber(const std::string& argument, const std::string& text);
 // Reads a moment: seconds since the epoch in decimal, not negative, with nothing around them.
 int64_t ReadMoment(const std::string& argument, const std::string& text);
 
-// Reads the whole of a file, "-" for the standard input.
-std::string ReadText(const std::string& argument, const std::string& name);
+// Reads the whole of a file, "-" for the standard input, if it is not longer than that.
+std::string ReadText(const std::string& argument, const std::string& name, size_t mostBytes);
 
 // Reads a JSON value from what the user gave: an object's JSON text, which begins with "{", or else
 // the name of a file that holds JSON of any kind, "-" for the standard input.

@@ -2,32 +2,53 @@
 #include <sys/stat.h>
 
 #include <cerrno>
+#include <chrono>
 #include <csignal>
 #include <cstdlib>
 #include <cstring>
 #include <ctime>
 #include <filesystem>
 #include <memory>
+#include <thread>
 
 #include "arguments.h"
 #include "base/paths.h"
 #include "command.h"
+#include "common/collect_lock.h"
 #include "daemon_commands.h"
+#include "job.h"
+#include "leftovers.h"
+#include "limit_options.h"
 #include "progress.h"
 #include "quendel.h"
 #include "run_watch.h"
+#include "unrecorded.h"
 #include "worker.h"
 
 namespace quendelctl {
 namespace {
 
 namespace fs = std::filesystem;
+using quendel::programs::CollectLock;
+using quendel::programs::LockHolder;
+using Clock = std::chrono::steady_clock;
+
+// What the worker of a run reports.
+constexpr char kDone[] = "done";
+constexpr char kFailed[] = "failed";
+
+std::string Describe(const LockHolder& holder) {
+  return holder.process == 0 ? "a program that has only now begun"
+                             : holder.program + ", process " + std::to_string(holder.process);
+}
 
 struct CollectArguments {
   bool send = false;
   bool keep = false;
   bool now = false;
+  bool wait = false;
   std::string perf;
+  LimitArguments limits;
 };
 
 Json::Value ReadSeries(const std::string& text) {
@@ -38,33 +59,39 @@ Json::Value ReadSeries(const std::string& text) {
   return series;
 }
 
-// The run keeps its files, so that there is something to tell of; they are removed afterwards.
-WorkerEnd Collect(bool send, const Json::Value& series, RunWatch& run) {
-  Progress progress;
-  const WorkerEnd end = RunInWorker([&] { return QUENDELStartCollect(0, send ? 1 : 0, series); },
-                                    [&](pid_t worker) {
-                                      run.Look(worker);
-                                      progress.Show(run);
-                                    });
-  progress.Finish();
-  run.Settle(end.result.has_value());
-  return end;
+// Waits for another run, if that is wanted, as long as there is time.
+CollectLock::Result TakeLock(CollectLock& lock, bool wait, Clock::time_point deadline) {
+  constexpr std::chrono::milliseconds kTryEvery(100);
+  ProgressLine line;
+  CollectLock::Result result = lock.Take();
+  while (result == CollectLock::Result::kHeld && wait && Clock::now() < deadline) {
+    if (line.IsDue()) {
+      line.Draw("waiting for another collection: " + Describe(lock.holder()));
+    }
+    std::this_thread::sleep_for(kTryEvery);
+    result = lock.Take();
+  }
+  line.Finish();
+  return result;
 }
 
-// A run that was ended in the middle leaves the files that mark its collectors.
-void RemoveStaleMarkers() {
-  constexpr char kMarker[] = "xxx.p.";  // "udc" or "log", then the process id
-  std::error_code error;
-  for (const auto& entry : fs::directory_iterator(quendel::kWorkRoot, error)) {
-    const std::string name = entry.path().filename();
-    if (name.rfind("udc.p.", 0) != 0 && name.rfind("log.p.", 0) != 0) {
-      continue;
-    }
-    const pid_t id = static_cast<pid_t>(strtol(name.c_str() + strlen(kMarker), nullptr, 10));
-    if (id > 0 && kill(id, 0) != 0 && errno == ESRCH) {
-      fs::remove(entry.path(), error);
-    }
-  }
+// The run keeps its files, so that there is something to tell of; they are removed afterwards.
+WorkerEnd Collect(const WorkerLimits& limits, bool send, const Json::Value& series,
+                  const CollectLock& lock, RunWatch& run) {
+  Progress progress;
+  const WorkerEnd end = RunInWorker(
+      limits,
+      [&] {
+        lock.TakeOver();
+        return std::string(QUENDELStartCollect(0, send ? 1 : 0, series) == 0 ? kDone : kFailed);
+      },
+      [&](pid_t worker) {
+        run.Look(worker);
+        progress.Show(run);
+      });
+  progress.Finish();
+  run.Settle(end.report.has_value());
+  return end;
 }
 
 void RemoveRun(const RunWatch& run) {
@@ -74,9 +101,13 @@ void RemoveRun(const RunWatch& run) {
   }
 }
 
-std::string DescribeFailure(const WorkerEnd& end) {
+std::string DescribeFailure(const WorkerEnd& end, const WorkerLimits& limits) {
   if (end.interrupted) {
     return "The collection was interrupted.";
+  }
+  if (end.timed_out) {
+    return "The collection took longer than " + std::to_string(limits.time.count()) +
+           " s and was ended; --timeout sets another limit.";
   }
   if (end.signal == SIGTERM) {
     return "The collection failed: the run was ended by SIGTERM, which it sends itself when it "
@@ -87,6 +118,15 @@ std::string DescribeFailure(const WorkerEnd& end) {
            " (" + strsignal(end.signal) + ").";
   }
   return "The collection failed.";
+}
+
+// Makes the result the failure of a run that did not come to a good end.
+void TellFailure(const WorkerEnd& end, const WorkerLimits& limits, Result& result) {
+  result.lines.push_back(DescribeFailure(end, limits));
+  const bool endedItself = end.report || end.signal == SIGTERM;
+  if (!endedItself || end.interrupted || end.timed_out) {
+    result.reason = FailureOf(end, limits).reason;
+  }
 }
 
 std::string DescribeLogs(const std::set<std::string>& logs) {
@@ -131,6 +171,7 @@ void TellWhatIsKept(const RunWatch& run, Result& result) {
   if (!run.Directory().empty()) {
     result.lines.push_back("Run directory: " + run.Directory());
     result.members["run_directory"] = run.Directory();
+    MarkAsKept(run.Directory());
   }
   if (run.ArchiveBytes()) {
     result.lines.push_back("Archive: " + run.Archive());
@@ -138,29 +179,63 @@ void TellWhatIsKept(const RunWatch& run, Result& result) {
   }
 }
 
-Result RunCollection(const CollectArguments& arguments) {
-  const Json::Value series = ReadSeries(arguments.perf);
-  RunWatch run(arguments.send);
-  const WorkerEnd end = Collect(arguments.send, series, run);
+// What was delivered and not noted as collected comes again.
+void TellWhatIsNotRecorded(const RunWatch& run, Result& result) {
+  result.members["not_recorded"] = Json::arrayValue;
+  for (const Unrecorded& collector : FindUnrecorded(run)) {
+    result.members["not_recorded"].append(collector.name);
+    result.lines.push_back("Not recorded as collected: " + collector.name + ", as " +
+                           collector.reason + ". The next collection gathers it again.");
+  }
+}
 
+Result NewResult() {
   Result result;
-  result.success = end.result == 0;
-  result.members["interrupted"] = end.interrupted;
-  result.members["sent"] = result.success && arguments.send;
+  result.members["interrupted"] = false;
+  result.members["sent"] = false;
   for (const char* unknown : {"archive", "bytes", "logs_collected", "run_directory"}) {
     result.members[unknown] = Json::nullValue;
   }
-  result.members["logs_sent"] = Json::arrayValue;
+  for (const char* list : {"logs_sent", "not_recorded"}) {
+    result.members[list] = Json::arrayValue;
+  }
+  return result;
+}
+
+Result NotStarted(Result result, CollectLock::Result why, const LockHolder& holder) {
+  if (why == CollectLock::Result::kFailed) {
+    result.lines = {std::string("Nothing was done: cannot take ") + quendel::kCollectLockFile +
+                    ": " + strerror(errno) + "."};
+    return result;
+  }
+  result.reason = "busy";
+  result.lines = {"Nothing was done: a collection goes on, by " + Describe(holder) + "."};
+  result.members["held_by"]["process"] =
+      holder.process == 0 ? Json::Value() : Json::Value(holder.process);
+  result.members["held_by"]["program"] =
+      holder.process == 0 ? Json::Value() : Json::Value(holder.program);
+  return result;
+}
+
+Result RunWithLock(const CollectArguments& arguments, const WorkerLimits& limits,
+                   const Json::Value& series, const CollectLock& lock) {
+  RunWatch run(arguments.send);
+  const WorkerEnd end = Collect(limits, arguments.send, series, lock, run);
+  Result result = NewResult();
+  result.success = end.report == kDone;
+  result.members["interrupted"] = end.interrupted;
+  result.members["sent"] = result.success && arguments.send;
   if (result.success) {
     TellWhatWasCollected(arguments.send, run, result);
+    TellWhatIsNotRecorded(run, result);
   } else {
-    result.lines.push_back(DescribeFailure(end));
+    TellFailure(end, limits, result);
   }
-  if (!end.result) {
+  if (!end.report) {
     RemoveStaleMarkers();
   }
   if (run.IsAmbiguous()) {
-    result.lines.push_back("Another run made a directory in /tmp meanwhile; both stay there.");
+    result.lines.emplace_back("Another run made a directory in /tmp meanwhile; both stay there.");
   }
   if (arguments.keep) {
     TellWhatIsKept(run, result);
@@ -170,20 +245,37 @@ Result RunCollection(const CollectArguments& arguments) {
   return result;
 }
 
+Result RunCollection(const CollectArguments& arguments) {
+  const WorkerLimits limits = ReadLimits(arguments.limits);
+  const Json::Value series = ReadSeries(arguments.perf);
+  const Clock::time_point deadline = Clock::now() + limits.time;
+  CollectLock lock("quendelctl");
+  const CollectLock::Result taken = TakeLock(lock, arguments.wait, deadline);
+  if (taken != CollectLock::Result::kTaken) {
+    return NotStarted(NewResult(), taken, lock.holder());
+  }
+  return RunWithLock(arguments, limits, series, lock);
+}
+
 Action DeclareCollect(CLI::App& command) {
   const auto arguments = std::make_shared<CollectArguments>();
   command.add_flag("--send", arguments->send, "Send the archive to the server");
   command.add_flag("--keep", arguments->keep,
                    "Keep the run directory and the archive, and tell where they are");
+  command.add_flag(
+      "--wait", arguments->wait,
+      "Wait for the end of another collection, which takes of the\ntime limit as well");
   command
       .add_option("--perf", arguments->perf,
                   "Performance series to put in, as perf --series prints it: a\n"
                   "file (- is the standard input) or a JSON object")
       ->type_name("FILE|JSON");
+  DeclareLimits(command, arguments->limits, WaitFor::kTransfer);
   command.add_flag("--now", arguments->now,
                    "Have quendeld collect and send, and wait until it has");
   return [arguments] {
-    const bool hasOthers = arguments->send || arguments->keep || !arguments->perf.empty();
+    const bool hasOthers =
+        arguments->send || arguments->keep || arguments->wait || !arguments->perf.empty();
     if (arguments->now && hasOthers) {
       throw CLI::ValidationError("--now", "leaves everything else to quendeld");
     }
@@ -194,6 +286,7 @@ Action DeclareCollect(CLI::App& command) {
 struct TarArguments {
   std::string directory;
   std::string archive;
+  LimitArguments limits;
 };
 
 // The library takes the parent and the last component of a path that has both.
@@ -215,18 +308,26 @@ std::string ReadDirectory(const std::string& text) {
   return path.rfind('/') == 0 ? "/" + path : path;
 }
 
+Result Pack(const std::string& directory, const std::string& archive) {
+  Result result;
+  result.success = QUENDELTarCollectData(directory.c_str(), archive.c_str()) == 0;
+  return result;
+}
+
 Result PackDirectory(const TarArguments& arguments) {
+  const WorkerLimits limits = ReadLimits(arguments.limits);
   const std::string directory = ReadDirectory(arguments.directory);
-  if (arguments.archive.empty()) {
-    throw CLI::ValidationError("ARCHIVE", "a file name is needed");
+  if (arguments.archive.empty() || arguments.archive == "-") {
+    throw CLI::ValidationError("ARCHIVE",
+                               "a file name is needed, as tar cannot write to a pipe here");
   }
   // tar would take a name with a colon in it for one on another machine, but not a path.
   const std::string archive = fs::absolute(arguments.archive);
-  Result result;
-  result.success = QUENDELTarCollectData(directory.c_str(), archive.c_str()) == 0;
+  Result result = RunJob(limits, "tar", [&] { return Pack(directory, archive); });
   result.members["archive"] = arguments.archive;
+  result.members["bytes"] = Json::nullValue;
   if (!result.success) {
-    result.lines = {arguments.directory + " could not be packed."};
+    result.lines.insert(result.lines.begin(), arguments.directory + " could not be packed.");
     return result;
   }
   std::error_code error;
@@ -243,12 +344,57 @@ Action DeclareTar(CLI::App& command) {
   command.add_option("ARCHIVE", arguments->archive, "The archive to make or replace, a .tar.xz")
       ->required()
       ->type_name("");
+  DeclareLimits(command, arguments->limits, WaitFor::kTransfer);
   return [arguments] { return PackDirectory(*arguments); };
+}
+
+struct CleanArguments {
+  bool list = false;
+};
+
+// Removes what is left, and tells of each path what became of it.
+void CleanUp(bool listOnly, Result& result) {
+  result.success = true;
+  for (const std::string& path : FindLeftovers()) {
+    const bool removed = !listOnly && QUENDELRecursiveRmdir(path.c_str()) == 0;
+    result.members["found"].append(path);
+    if (removed) {
+      result.members["removed"].append(path);
+    } else if (!listOnly) {
+      result.success = false;
+      result.members["error"] = "Not everything could be removed.";
+    }
+    result.lines.push_back(path + (listOnly  ? ""
+                                   : removed ? ": removed"
+                                             : ": could not be removed"));
+  }
+  if (result.lines.empty()) {
+    result.lines = {"No run has left anything behind."};
+  }
+}
+
+Result Clean(const CleanArguments& arguments) {
+  Result result;
+  result.members["found"] = result.members["removed"] = Json::arrayValue;
+  CollectLock lock("quendelctl");
+  const CollectLock::Result taken = lock.Take();
+  if (taken != CollectLock::Result::kTaken) {
+    return NotStarted(result, taken, lock.holder());
+  }
+  CleanUp(arguments.list, result);
+  return result;
+}
+
+Action DeclareClean(CLI::App& command) {
+  const auto arguments = std::make_shared<CleanArguments>();
+  command.add_flag("--list", arguments->list, "Only show what would be removed");
+  return [arguments] { return Clean(*arguments); };
 }
 
 struct SendArguments {
   std::string file;
   std::string time;
+  LimitArguments limits;
 };
 
 // An archive is finished soon after its run began, which is what the server wants to know.
@@ -257,13 +403,19 @@ int64_t TimeOfFile(const std::string& path) {
   return stat(path.c_str(), &status) == 0 ? status.st_mtime : time(nullptr);
 }
 
+Result Deliver(const std::string& file, int64_t moment) {
+  Result result;
+  result.success = QUENDELSendCollectData(file.c_str(), moment) == 0;
+  result.lines = {result.success ? "The server accepted " + file + "."
+                                 : "The server did not get or accept " + file + "."};
+  return result;
+}
+
 Result SendArchive(const SendArguments& arguments) {
   const int64_t moment =
       arguments.time.empty() ? TimeOfFile(arguments.file) : ReadMoment("--time", arguments.time);
-  Result result;
-  result.success = QUENDELSendCollectData(arguments.file.c_str(), moment) == 0;
-  result.lines = {result.success ? "The server accepted " + arguments.file + "."
-                                 : "The server did not get or accept " + arguments.file + "."};
+  Result result = RunJob(ReadLimits(arguments.limits), "the upload to end",
+                         [&] { return Deliver(arguments.file, moment); });
   result.members["file"] = arguments.file;
   result.members["timestamp"] = static_cast<Json::Int64>(moment);
   return result;
@@ -279,6 +431,7 @@ Action DeclareSend(CLI::App& command) {
                   "When the run began, in seconds since the epoch; the time of\n"
                   "the file's last change if not given")
       ->type_name("SECONDS");
+  DeclareLimits(command, arguments->limits, WaitFor::kTransfer);
   return [arguments] { return SendArchive(*arguments); };
 }
 
@@ -299,6 +452,14 @@ Examples:
        R"(Example:
   quendelctl tar /tmp/quendel_20240305_070809_0 /tmp/again.tar.xz)",
        DeclareTar},
+      {"clean", "Remove what collections that died have left behind",
+       R"(That is: run directories in /tmp, the archives beside them, and collectors' markers, if they are
+your own and nothing else is in them. What collect --keep has kept stays.
+
+Examples:
+  quendelctl clean --list
+  quendelctl clean)",
+       DeclareClean},
       {"send", "Send the archive of a collection to the server",
        R"(Examples:
   quendelctl send /tmp/quendel_20240305_070809_0.tar.xz

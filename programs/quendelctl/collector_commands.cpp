@@ -82,6 +82,7 @@ void AddUnreadable(Result& result, Json::Value& entry, const std::string& file) 
   entry["state"] = "no-collector";
   result.lines.push_back(file + ": cannot be read as a collector");
   result.success = false;
+  result.members["error"] = "Not every collector can be read.";
 }
 
 void AddLog(Result& result, Json::Value& entry, const std::string& file) {
@@ -221,7 +222,10 @@ Result ResetCollectors(const ResetArguments& arguments) {
   result.members["reset"] = result.members["failed"] = Json::arrayValue;
   for (const std::string& file : files) {
     const bool done = Reset(file);
-    result.success = result.success && done;
+    if (!done) {
+      result.success = false;
+      result.members["error"] = "Not every collector could be reset.";
+    }
     result.members[done ? "reset" : "failed"].append(file);
     result.lines.push_back(file + (done ? ": reset" : ": could not be reset"));
   }
@@ -231,34 +235,38 @@ Result ResetCollectors(const ResetArguments& arguments) {
   return result;
 }
 
-Action DeclareConf(CLI::App& command) {
-  CLI::App* list = command.add_subcommand("list", "Show every collector and how it stands");
-  CLI::App* reset = command.add_subcommand(
-      "reset", "Forget what was collected, so that the next collection sends all of it again");
+Action DeclareList(CLI::App& /*command*/) {
+  return ListCollectors;
+}
+
+Action DeclareReset(CLI::App& command) {
   const auto arguments = std::make_shared<ResetArguments>();
-  reset->add_option("NAME", arguments->name, "A collector's settings file, or the name in it")
+  command.add_option("NAME", arguments->name, "A collector's settings file, or the name in it")
       ->type_name("");
-  reset->add_flag("--all", arguments->all, "Every collector");
-  command.require_subcommand(0, 1);
-  return [list, reset, arguments] {
-    if (!list->parsed() && !reset->parsed()) {
-      throw CLI::RequiredError("list or reset");
-    }
-    return list->parsed() ? ListCollectors() : ResetCollectors(*arguments);
-  };
+  command.add_flag("--all", arguments->all, "Every collector");
+  return [arguments] { return ResetCollectors(*arguments); };
+}
+
+Action DeclareConf(CLI::App& command) {
+  return DeclareGroup(
+      command,
+      {{"list", "Show every collector and how it stands",
+        R"(Examples:
+  quendelctl conf list
+  quendelctl conf list --json)",
+        DeclareList},
+       {"reset", "Forget what was collected, so that the next collection sends all of it again",
+        R"(Examples:
+  quendelctl conf reset quendel.log.messages
+  quendelctl conf reset --all)",
+        DeclareReset}});
 }
 
 }  // namespace
 
 std::vector<Command> CollectorCommands() {
   return {
-      {"conf", "Show or reset what the collectors remember of what was collected",
-       R"(Examples:
-  quendelctl conf list
-  quendelctl conf list --json
-  quendelctl conf reset quendel.log.messages
-  quendelctl conf reset --all)",
-       DeclareConf},
+      {"conf", "Show or reset what the collectors remember of what was collected", "", DeclareConf},
   };
 }
 

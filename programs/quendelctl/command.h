@@ -12,11 +12,13 @@
 
 namespace quendelctl {
 
-// What came of a command. The reason of a failure is in the library's log lines.
+// What came of a command. What made the library fail is in its log lines.
 struct Result {
   bool success = false;
+  std::string reason = "failed";            // why not, in a word for programs
   Json::Value members = Json::objectValue;  // printed with --json, together with "success"
   std::vector<std::string> lines;           // printed without; may hold any bytes
+  std::string text;                         // of the program's own, printed in either form
   std::string bytes;                        // likewise, but as they are, to anything but a terminal
   std::optional<int> exit_status = {};      // when it is not 0 for success and 1 for failure
   bool keeps_process = false;               // once it is printed, until a signal ends the process

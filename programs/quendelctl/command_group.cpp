@@ -18,13 +18,18 @@ Action DeclareGroup(CLI::App& group, const std::vector<Command>& commands) {
     declared.emplace_back(subcommand, command.declare(*subcommand));
   }
   group.require_subcommand(0, 1);
-  return [declared] {
+  std::vector<std::string> names;
+  for (const Command& command : commands) {
+    names.emplace_back(command.name);
+  }
+  return [declared, names, name = group.get_name()] {
     for (const auto& [subcommand, action] : declared) {
       if (subcommand->parsed()) {
         return action();
       }
     }
-    throw CLI::RequiredError("A command");
+    throw CLI::ValidationError(
+        name, "one of these commands is required: " + CLI::detail::join(names, ", "));
   };
 }
 

@@ -5,11 +5,15 @@
 #include "arguments.h"
 #include "command.h"
 #include "daemon_commands.h"
+#include "job.h"
+#include "limit_options.h"
 #include "output.h"
 #include "quendel.h"
 
 namespace quendelctl {
 namespace {
+
+constexpr char kServersAnswer[] = "the server's answer";
 
 std::vector<std::string> DescribeActions(const Json::Value& actions) {
   if (actions.empty()) {  // null, or an array or object that holds nothing
@@ -41,13 +45,18 @@ Result SendHeartbeat() {
 
 Action DeclareHeartbeat(CLI::App& command) {
   const auto now = std::make_shared<bool>(false);
+  const auto limits = std::make_shared<LimitArguments>();
   command.add_flag("--now", *now, "Have quendeld send its next one now, and act on what it gets");
-  return [now] { return *now ? HaveDaemonBeat() : SendHeartbeat(); };
+  DeclareLimits(command, *limits, WaitFor::kAnswer);
+  return [now, limits] {
+    return *now ? HaveDaemonBeat() : RunJob(ReadLimits(*limits), kServersAnswer, SendHeartbeat);
+  };
 }
 
 struct EventArguments {
   std::string name;
   std::string info;
+  LimitArguments limits;
 };
 
 // The command line has let only names of the table through.
@@ -59,31 +68,39 @@ QuendelEvent_t EventByName(const std::string& name) {
   return static_cast<QuendelEvent_t>(event);
 }
 
-Result ReportEvent(const EventArguments& arguments) {
-  const QuendelEvent_t event = EventByName(arguments.name);
-  Json::Value info = Json::objectValue;
-  if (!arguments.info.empty()) {
-    if (event != QUENDEL_EVENT_ENABLE) {
-      throw CLI::ValidationError("--info", "goes with the event enable only");
-    }
-    info = ReadJson("--info", arguments.info);
+Json::Value ReadInfo(const EventArguments& arguments) {
+  if (arguments.info.empty()) {
+    return Json::objectValue;
   }
-  if (event == QUENDEL_EVENT_LOGOUT) {
+  if (EventByName(arguments.name) != QUENDEL_EVENT_ENABLE) {
+    throw CLI::ValidationError("--info", "goes with the event enable only");
+  }
+  return ReadJson("--info", arguments.info);
+}
+
+Result SendEvent(const std::string& name, const Json::Value& info) {
+  Result result;
+  Json::Value reply;
+  result.success = QUENDELPostEventToServer(EventByName(name), reply, info) == 0;
+  result.lines = {result.success ? "The server accepted the event " + name + "."
+                                 : "The event " + name + " was not accepted."};
+  if (!result.success && !reply.isNull()) {
+    result.lines.push_back("The server answered: " + JsonForReader(reply));
+  }
+  result.members["event"] = name;
+  result.members["reply"] = reply;
+  return result;
+}
+
+Result ReportEvent(const EventArguments& arguments) {
+  const Json::Value info = ReadInfo(arguments);
+  if (EventByName(arguments.name) == QUENDEL_EVENT_LOGOUT) {
     if (const std::optional<Result> told = HaveDaemonSendLogout()) {
       return *told;
     }
   }
-  Result result;
-  Json::Value reply;
-  result.success = QUENDELPostEventToServer(event, reply, info) == 0;
-  result.lines = {result.success ? "The server accepted the event " + arguments.name + "."
-                                 : "The event " + arguments.name + " was not accepted."};
-  if (!result.success && !reply.isNull()) {
-    result.lines.push_back("The server answered: " + JsonForReader(reply));
-  }
-  result.members["event"] = arguments.name;
-  result.members["reply"] = reply;
-  return result;
+  return RunJob(ReadLimits(arguments.limits), kServersAnswer,
+                [&] { return SendEvent(arguments.name, info); });
 }
 
 Action DeclareEvent(CLI::App& command) {
@@ -98,6 +115,7 @@ Action DeclareEvent(CLI::App& command) {
                   "Description of the device, for the event enable only: a JSON\n"
                   "object, or a file that holds JSON (- is the standard input)")
       ->type_name("FILE|JSON");
+  DeclareLimits(command, arguments->limits, WaitFor::kAnswer);
   return [arguments] { return ReportEvent(*arguments); };
 }
 
@@ -115,6 +133,7 @@ struct ProgressArguments {
   std::string id;
   std::string value;
   std::string details;
+  LimitArguments limits;
 };
 
 const ProgressWord& ReadProgress(const std::string& text) {
@@ -127,11 +146,7 @@ const ProgressWord& ReadProgress(const std::string& text) {
                              text + " is none of run, done, failed, no-file, 1, 0, -1, -3");
 }
 
-Result ReportProgress(const ProgressArguments& arguments) {
-  const int id = ReadNumber("ID", arguments.id);
-  const ProgressWord& progress = ReadProgress(arguments.value);
-  const Json::Value details = arguments.details.empty() ? Json::Value(Json::objectValue)
-                                                        : ReadJson("--details", arguments.details);
+Result SendProgress(int id, const ProgressWord& progress, const Json::Value& details) {
   Result result;
   result.success = QUENDELUpdateActRequestProgress(id, progress.value, details) == 0;
   const std::string report = "report on request " + std::to_string(id) + ": " + progress.word + ".";
@@ -140,6 +155,15 @@ Result ReportProgress(const ProgressArguments& arguments) {
   result.members["request_id"] = id;
   result.members["progress"] = progress.value;
   return result;
+}
+
+Result ReportProgress(const ProgressArguments& arguments) {
+  const int id = ReadNumber("ID", arguments.id);
+  const ProgressWord& progress = ReadProgress(arguments.value);
+  const Json::Value details = arguments.details.empty() ? Json::Value(Json::objectValue)
+                                                        : ReadJson("--details", arguments.details);
+  return RunJob(ReadLimits(arguments.limits), kServersAnswer,
+                [&] { return SendProgress(id, progress, details); });
 }
 
 Action DeclareProgress(CLI::App& command) {
@@ -157,6 +181,7 @@ Action DeclareProgress(CLI::App& command) {
                   "What to send with it: a JSON object, or a file that holds JSON\n"
                   "(- is the standard input); an empty object if not given")
       ->type_name("FILE|JSON");
+  DeclareLimits(command, arguments->limits, WaitFor::kAnswer);
   return [arguments] { return ReportProgress(*arguments); };
 }
 

@@ -1,7 +1,11 @@
 // The commands that tell about the device, the way to the server, and the program.
 #include <ctime>
+#include <memory>
 
 #include "command.h"
+#include "hindrances.h"
+#include "job.h"
+#include "limit_options.h"
 #include "output.h"
 #include "quendel.h"
 
@@ -26,6 +30,13 @@ Result TestConnection() {
   return result;
 }
 
+Action DeclareTestConnection(CLI::App& command) {
+  const auto limits = std::make_shared<LimitArguments>();
+  DeclareLimits(command, *limits, WaitFor::kAnswer);
+  return
+      [limits] { return RunJob(ReadLimits(*limits), "two connections in a row", TestConnection); };
+}
+
 // Adds a fact to both forms of the output. A fact that could not be found out fails the command,
 // but not before the others are shown.
 void AddFact(Result& result, const char* label, const char* member, bool known,
@@ -41,7 +52,10 @@ void AddFact(Result& result, const char* label, const char* member, bool known,
   }
   result.lines.push_back(line);
   result.members[member] = known ? value : Json::Value();
-  result.success = result.success && known;
+  if (!known) {
+    result.success = false;
+    result.members["error"] = "Not every fact could be found out.";
+  }
 }
 
 Result ShowFacts() {
@@ -62,6 +76,11 @@ Result ShowFacts() {
   AddFact(result, "Service enabled:", "service_enabled", true, QUENDELIsEnable() != 0);
   AddFact(result, "Server host:", "server_host", true, QUENDELGetServerHost());
   AddFact(result, "Contact:", "contact", hasConf, conf.contact);
+  result.members["warnings"] = Json::arrayValue;
+  for (const std::string& warning : FindHindrances()) {
+    result.lines.push_back("Warning: " + warning);
+    result.members["warnings"].append(warning);
+  }
   return result;
 }
 
@@ -92,7 +111,7 @@ std::vector<Command> DeviceCommands() {
 
 Example:
   quendelctl test-connection && echo reachable)",
-       WithoutArguments<TestConnection>},
+       DeclareTestConnection},
       {"facts", "Show the device's model, version, time and settings of the service",
        R"(Examples:
   quendelctl facts

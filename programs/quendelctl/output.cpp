@@ -30,12 +30,23 @@ std::string AsciiJson(const Json::Value& value, const char* indentation = "") {
   return text;
 }
 
+void AddFailure(const Result& result, Json::Value& object) {
+  object["reason"] = result.reason;
+  if (!object.isMember("error")) {
+    object["error"] = result.lines.empty() ? "It failed." : result.lines[0];
+  }
+}
+
 }  // namespace
 
 void PrintResult(const Result& result, bool json) {
-  if (json) {
+  PrintText(result.text);
+  if (json && result.text.empty()) {
     Json::Value object = result.members;
     object["success"] = result.success;
+    if (!result.success) {
+      AddFailure(result, object);
+    }
     PrintText(AsciiJson(object) + "\n");
     return;
   }

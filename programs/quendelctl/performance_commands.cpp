@@ -1,10 +1,15 @@
 // The command that asks the device for its performance figures.
-#include <ctime>
+#include <algorithm>
+#include <chrono>
 #include <memory>
+#include <thread>
 
 #include "arguments.h"
 #include "command.h"
+#include "job.h"
+#include "limit_options.h"
 #include "output.h"
+#include "progress.h"
 #include "quendel.h"
 
 namespace quendelctl {
@@ -13,12 +18,30 @@ namespace {
 struct PerfArguments {
   std::string series;
   std::string every;
+  LimitArguments limits;
 };
 
-Json::Value TakeSample() {
-  Json::Value sample;
-  sample["success"] = QUENDELCollectPerf(sample["perf_data"]) == 0;
-  return sample;
+Result AskForSample() {
+  Result result;
+  result.success = QUENDELCollectPerf(result.members["perf_data"]) == 0;
+  result.lines = {"The performance service gave no figures."};  // unless it did
+  return result;
+}
+
+Result TakeSample(const WorkerLimits& limits) {
+  return RunJob(limits, "the performance service's answer", AskForSample);
+}
+
+// Both forms of the output are JSON, and tell the same.
+Json::Value AsJson(const Result& sample) {
+  Json::Value value;
+  value["success"] = sample.success;
+  value["perf_data"] = sample.members["perf_data"];
+  if (!sample.success) {
+    value["error"] = sample.lines.at(0);
+    value["reason"] = sample.reason;
+  }
+  return value;
 }
 
 int ReadCount(const std::string& argument, const std::string& text) {
@@ -29,44 +52,63 @@ int ReadCount(const std::string& argument, const std::string& text) {
   return count;
 }
 
-Result ShowSample() {
-  const Json::Value sample = TakeSample();
+Result ShowSample(const WorkerLimits& limits) {
+  const Result sample = TakeSample(limits);
   Result result;
-  result.success = sample["success"].asBool();
-  result.members["perf_data"] = sample["perf_data"];
-  result.lines = JsonLines(sample);
-  return result;
-}
-
-// The samples keep their distance however long each of them takes.
-Result ShowSeries(int count, int everySeconds) {
-  Result result;
-  result.success = true;
-  timespec next = {};
-  clock_gettime(CLOCK_MONOTONIC, &next);
-  for (int number = 0; number < count; ++number) {
-    if (number > 0) {
-      next.tv_sec += everySeconds;
-      while (clock_nanosleep(CLOCK_MONOTONIC, TIMER_ABSTIME, &next, nullptr) != 0) {
-      }
-    }
-    Json::Value& sample = result.members["perf_" + std::to_string(number)];
-    sample = TakeSample();
-    result.success = result.success && sample["success"].asBool();
-  }
+  result.success = sample.success;
+  result.members = AsJson(sample);
   result.lines = JsonLines(result.members);
   return result;
 }
 
+using Clock = std::chrono::steady_clock;
+
+void SleepUntil(Clock::time_point moment, ProgressLine& line, const std::string& text) {
+  constexpr std::chrono::milliseconds kLookEvery(100);
+  while (Clock::now() < moment) {
+    if (line.IsDue()) {
+      line.Draw(text);
+    }
+    std::this_thread::sleep_until(std::min(moment, Clock::now() + kLookEvery));
+  }
+  line.Finish();
+}
+
+// The samples keep their distance however long each of them takes.
+Result ShowSeries(int count, std::chrono::seconds every, const WorkerLimits& limits) {
+  Result result;
+  result.success = true;
+  ProgressLine line;
+  Clock::time_point next = Clock::now();
+  for (int number = 0; number < count && result.reason != "interrupted"; ++number) {
+    const std::string taken = std::to_string(number) + " of " + std::to_string(count);
+    SleepUntil(next, line, "taking samples: " + taken);
+    next += every;
+    const Result sample = TakeSample(limits);
+    result.members["perf_" + std::to_string(number)] = AsJson(sample);
+    if (!sample.success) {
+      result.success = false;
+      result.reason = sample.reason;
+    }
+  }
+  result.lines = JsonLines(result.members);
+  if (!result.success) {
+    result.members["error"] = "Not every sample could be taken.";
+  }
+  return result;
+}
+
 Result ShowFigures(const PerfArguments& arguments) {
+  const WorkerLimits limits = ReadLimits(arguments.limits);
   if (!arguments.series.empty()) {
     const int count = ReadCount("--series", arguments.series);
-    return ShowSeries(count, arguments.every.empty() ? 1 : ReadCount("--every", arguments.every));
+    const int every = arguments.every.empty() ? 1 : ReadCount("--every", arguments.every);
+    return ShowSeries(count, std::chrono::seconds(every), limits);
   }
   if (!arguments.every.empty()) {
     throw CLI::ValidationError("--every", "goes with --series only");
   }
-  return ShowSample();
+  return ShowSample(limits);
 }
 
 Action DeclarePerf(CLI::App& command) {
@@ -76,6 +118,7 @@ Action DeclarePerf(CLI::App& command) {
       ->type_name("N");
   command.add_option("--every", arguments->every, "Seconds from sample to sample, 1 if not given")
       ->type_name("S");
+  DeclareLimits(command, arguments->limits, WaitFor::kAnswer);
   return [arguments] { return ShowFigures(*arguments); };
 }
 

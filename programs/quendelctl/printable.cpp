@@ -56,9 +56,20 @@ bool IsSafe(char32_t code) {
   static constexpr Range kUnsafe[] = {
       {0x00, 0x1F},      // control characters, the escape character among them
       {0x7F, 0x9F},      // and the second set of them
-      {0x200E, 0x200F},  // marks, embeddings, overrides and isolates of the direction of writing
-      {0x2028, 0x202E},  // with the separators of lines and paragraphs before them
-      {0x2066, 0x2069}, {0xFEFF, 0xFEFF},  // a character without width
+      {0xAD, 0xAD},      // a hyphen that is not seen
+      {0x034F, 0x034F},  // a joiner of letters
+      {0x061C, 0x061C},  // the Arabic mark of the direction of writing
+      {0x115F, 0x1160},  // fillers in place of letters, here and below
+      {0x17B4, 0x17B5},  // vowels that are not seen
+      {0x180B, 0x180F},  // Mongolian variants, and a vowel separator
+      {0x200B, 0x200F},  // spaces and joiners without width, marks of the direction of writing
+      {0x2028, 0x202E},  // separators of lines and paragraphs, embeddings and overrides
+      {0x2060, 0x206F},  // more of the same, and isolates
+      {0x3164, 0x3164},
+      {0xFEFF, 0xFEFF},  // a space without width, or the mark of the order of bytes
+      {0xFFA0, 0xFFA0},
+      {0xFFF0, 0xFFFB},    // annotations
+      {0xE0000, 0xE0FFF},  // tags, and variants beyond the first sixteen
   };
   return std::none_of(std::begin(kUnsafe), std::end(kUnsafe),
                       [=](const Range& r) { return code >= r.first && code <= r.last; });

@@ -1,4 +1,4 @@
-// Shows how a collection run is getting on.
+// Shows on the standard error output how something that takes its time is getting on.
 #include "progress.h"
 
 #include <sys/ioctl.h>
@@ -6,13 +6,21 @@
 
 #include <cstdio>
 #include <string>
+#include <utility>
 
 #include "safe_stderr.h"
 
 namespace quendelctl {
 namespace {
 
+using Clock = std::chrono::steady_clock;
+
 constexpr std::chrono::milliseconds kRedrawEvery(200);
+constexpr std::chrono::seconds kMoment(1);
+
+std::chrono::seconds SecondsSince(Clock::time_point start) {
+  return std::chrono::duration_cast<std::chrono::seconds>(Clock::now() - start);
+}
 
 std::string InUnits(uint64_t bytes) {
   if (bytes < 1000) {
@@ -61,32 +69,48 @@ void WriteOnce(int terminal, const std::string& text) {
 
 }  // namespace
 
-Progress::Progress() : redraws_(CanRedraw(RawStderr())), start_(Clock::now()) {
+ProgressLine::ProgressLine() : redraws_(CanRedraw(RawStderr())) {
 }
 
-void Progress::Show(const RunWatch& run) {
-  if (redraws_) {
-    if (!drawn_ || Clock::now() - *drawn_ >= kRedrawEvery) {
-      Redraw(run);
-      drawn_ = Clock::now();
-    }
-  } else if (shown_ != run.phase()) {
-    fprintf(stderr, "quendelctl: %s\n", PhaseName(run.phase()));
-  }
-  shown_ = run.phase();
-}
-
-void Progress::Finish() {
-  if (drawn_) {
-    WriteOnce(RawStderr(), "\r\x1b[K");
-  }
+bool ProgressLine::IsDue() const {
+  return redraws_ && (!drawn_ || Clock::now() - *drawn_ >= kRedrawEvery);
 }
 
 // The cursor goes back to the beginning of the line, so that a log line takes its place.
-void Progress::Redraw(const RunWatch& run) {
-  const auto elapsed = std::chrono::duration_cast<std::chrono::seconds>(Clock::now() - start_);
-  const std::string text = Describe(run, elapsed).substr(0, Columns(RawStderr()));
-  WriteOnce(RawStderr(), "\r" + text + "\x1b[K\r");
+void ProgressLine::Draw(const std::string& text) {
+  WriteOnce(RawStderr(), "\r" + text.substr(0, Columns(RawStderr())) + "\x1b[K\r");
+  drawn_ = Clock::now();
+}
+
+void ProgressLine::Finish() {
+  if (drawn_) {
+    WriteOnce(RawStderr(), "\r\x1b[K");
+    drawn_.reset();
+  }
+}
+
+WaitingLine::WaitingLine(std::string text, std::chrono::seconds limit)
+    : text_(std::move(text)), limit_(limit), start_(Clock::now()) {
+}
+
+void WaitingLine::Show() {
+  const std::chrono::seconds elapsed = SecondsSince(start_);
+  if (elapsed >= kMoment && line_.IsDue()) {
+    line_.Draw(text_ + ": " + std::to_string(elapsed.count()) + " s of at most " +
+               std::to_string(limit_.count()) + " s");
+  }
+}
+
+Progress::Progress() : start_(Clock::now()) {
+}
+
+void Progress::Show(const RunWatch& run) {
+  if (line_.IsDue()) {
+    line_.Draw(Describe(run, SecondsSince(start_)));
+  } else if (!line_.is_shown() && shown_ != run.phase()) {
+    Complain(PhaseName(run.phase()));
+  }
+  shown_ = run.phase();
 }
 
 }  // namespace quendelctl

@@ -9,6 +9,9 @@
 #include "base/paths.h"
 #include "command.h"
 #include "daemon_commands.h"
+#include "job.h"
+#include "limit_options.h"
+#include "public_key.h"
 #include "quendel.h"
 #include "session_file.h"
 
@@ -17,11 +20,14 @@ namespace {
 
 constexpr uid_t kSupportUid = 50001;
 constexpr size_t kMaxSessionKeyBytes = 65536;
+constexpr char kOpenInPart[] =
+    "The remote session is open in part only: end it with \"quendelctl remote close\".";
 
 struct CreateArguments {
   std::string user;
   std::string key_file;
   bool stop_sshd = false;
+  LimitArguments limits;
 };
 
 // The name goes into a key=value file, which would read some names as something else, and the
@@ -36,17 +42,6 @@ void CheckUser(const std::string& user) {
   }
 }
 
-std::string ReadPublicKey(const std::string& keyFile) {
-  std::string key = ReadText("KEYFILE", keyFile);
-  if (key.find('\0') != key.npos) {
-    throw CLI::ValidationError("KEYFILE", "not a text: " + keyFile);
-  }
-  if (key.find("PRIVATE KEY-----") != key.npos) {  // everybody on the device could read it
-    throw CLI::ValidationError("KEYFILE", "holds a private key: " + keyFile);
-  }
-  return key;
-}
-
 // The account of a session is deleted when it ends, or cannot be opened.
 bool IsSomebodyElse(const std::string& user) {
   const passwd* const entry = getpwnam(user.c_str());
@@ -57,7 +52,7 @@ std::vector<std::string> ClearAway(const std::string& user) {
   if (QUENDELSupportAccountUserDelete(user.c_str()) == 0 && RemoveSessionFile()) {
     return {"No remote session was opened."};
   }
-  return {"The remote session is open in part only: end it with \"quendelctl remote close\"."};
+  return {kOpenInPart};
 }
 
 // An earlier holder of the account may have left keys of their own in its home, or still be there.
@@ -69,8 +64,6 @@ bool MakeAccountAfresh(const std::string& user, const std::string& key) {
 // The file comes first: whatever happens after it, the session can be ended.
 Result OpenSession(const std::string& user, const std::string& key, bool stopSshd) {
   Result result;
-  result.members["user"] = user;
-  result.members["stop_sshd"] = stopSshd;
   result.lines = {"No remote session was opened."};
   if (IsSomebodyElse(user)) {
     syslog(LOG_ERR, "%s is an account of this device that is not for remote support", user.c_str());
@@ -94,7 +87,16 @@ Result OpenSession(const std::string& user, const std::string& key, bool stopSsh
 
 Result CreateSession(const CreateArguments& arguments) {
   CheckUser(arguments.user);
-  return OpenSession(arguments.user, ReadPublicKey(arguments.key_file), arguments.stop_sshd);
+  const WorkerLimits limits = ReadLimits(arguments.limits);
+  const std::string key = ReadPublicKey(arguments.key_file, limits);
+  Result result = RunJob(limits, "the tools for accounts",
+                         [&] { return OpenSession(arguments.user, key, arguments.stop_sshd); });
+  result.members["user"] = arguments.user;
+  result.members["stop_sshd"] = arguments.stop_sshd;
+  if (!result.success && result.reason != "failed" && IsSessionOpen()) {
+    result.lines.emplace_back(kOpenInPart);
+  }
+  return result;
 }
 
 Action DeclareCreate(CLI::App& command) {
@@ -104,33 +106,48 @@ Action DeclareCreate(CLI::App& command) {
       ->type_name("");
   command
       .add_option("KEYFILE", arguments->key_file,
-                  "Public ssh keys that open it, as in an authorized_keys file\n"
-                  "(- is the standard input)")
+                  "File with the public ssh key that opens it, one line (- is the\n"
+                  "standard input)")
       ->required()
       ->type_name("");
   command.add_flag("--stop-sshd", arguments->stop_sshd,
                    "The ssh service runs for this session only: stop it at the end");
+  DeclareLimits(command, arguments->limits, WaitFor::kAnswer);
   return [arguments] { return CreateSession(*arguments); };
 }
 
 struct CloseArguments {
   std::string id;
   bool failed = false;
+  LimitArguments limits;
 };
+
+Result EndSession(int id, QuendelActionProgress_t progress) {
+  Result result;
+  result.success = QUENDELRemoteClose(id, progress) == 0;
+  result.lines = {result.success
+                      ? "The remote session is closed. The server accepted the report on request " +
+                            std::to_string(id) + ": " +
+                            (progress == QUENDEL_ACT_PROGRESS_FAILED ? "failed." : "done.")
+                      : "The remote session was not closed, or not to its end."};
+  return result;
+}
 
 Result CloseSession(const CloseArguments& arguments) {
   const int id = ReadNumber("ID", arguments.id);
+  const WorkerLimits limits = ReadLimits(arguments.limits);
   const QuendelActionProgress_t progress =
       arguments.failed ? QUENDEL_ACT_PROGRESS_FAILED : QUENDEL_ACT_PROGRESS_DONE;
   if (const std::optional<Result> closed = HaveDaemonCloseSession(id, progress)) {
     return *closed;
   }
   Result result;
-  result.success = QUENDELRemoteClose(id, progress) == 0;
-  result.lines = {result.success
-                      ? "The remote session is closed. The server accepted the report on request " +
-                            std::to_string(id) + ": " + (arguments.failed ? "failed." : "done.")
-                      : "The remote session was not closed, or not to its end."};
+  if (IsSessionOpen()) {
+    result = RunJob(limits, "the server's answer", [&] { return EndSession(id, progress); });
+  } else {
+    result.reason = "no-session";
+    result.lines = {"No remote session is open."};
+  }
   result.members["request_id"] = id;
   result.members["progress"] = progress;
   return result;
@@ -142,6 +159,7 @@ Action DeclareClose(CLI::App& command) {
       ->required()
       ->type_name("");
   command.add_flag("--failed", arguments->failed, "Report the session as failed, not as done");
+  DeclareLimits(command, arguments->limits, WaitFor::kAnswer);
   return [arguments] { return CloseSession(*arguments); };
 }
 
@@ -171,8 +189,10 @@ Result ShowKey() {
   return result;
 }
 
-Action DeclareKey(CLI::App& /*command*/) {
-  return ShowKey;
+Action DeclareKey(CLI::App& command) {
+  const auto limits = std::make_shared<LimitArguments>();
+  DeclareLimits(command, *limits, WaitFor::kAnswer);
+  return [limits] { return RunJob(ReadLimits(*limits), "the key", ShowKey); };
 }
 
 Action DeclareRemote(CLI::App& command) {

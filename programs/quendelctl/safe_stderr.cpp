@@ -2,12 +2,12 @@
 #include "safe_stderr.h"
 
 #include <fcntl.h>
+#include <sys/socket.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <cerrno>
 #include <csignal>
-#include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <string>
@@ -18,14 +18,11 @@
 namespace quendelctl {
 namespace {
 
-constexpr size_t kLongestPieceBytes = 65536;
+constexpr size_t kBlockBytes = 4096;
+constexpr int kLongestMessageBytes = 4 << 20;
 constexpr char kEraseRest[] = "\x1b[K";
 
 int rawStderr = STDERR_FILENO;
-
-void Complain(const char* what) {
-  fprintf(stderr, "quendelctl: %s: %s\n", what, strerror(errno));
-}
 
 void WriteAll(int descriptor, std::string_view text) {
   while (!text.empty()) {
@@ -40,44 +37,44 @@ void WriteAll(int descriptor, std::string_view text) {
   }
 }
 
-// How much of the text can be shown now: whole lines, or much of a very long one up to the
-// beginning of a character.
-size_t ShowableBytes(const std::string& text) {
-  const size_t lineEnd = text.rfind('\n');
-  if (lineEnd != std::string::npos) {
-    return lineEnd + 1;
+void ComplainOfSystem(const char* what) {
+  Complain(std::string(what) + ": " + strerror(errno));
+}
+
+// Makes what one call has written safe: a line, which may quote other lines.
+std::string Safe(std::string_view message) {
+  const bool ended = !message.empty() && message.back() == '\n';
+  if (ended) {
+    message.remove_suffix(1);
   }
-  if (text.size() < kLongestPieceBytes) {
-    return 0;
-  }
-  size_t end = text.size() - 4;
-  while (end < text.size() && (static_cast<unsigned char>(text[end]) & 0xC0) == 0x80) {
-    ++end;
-  }
-  return end;
+  return Printable(message, "\t") + (ended ? "\n" : "");
+}
+
+// Returns the size of the next message, which stays where it is; 0 when none will come any more.
+size_t AwaitMessage(int input) {
+  char first = 0;
+  ssize_t size = 0;
+  do {
+    size = recv(input, &first, 1, MSG_PEEK | MSG_TRUNC);
+  } while (size < 0 && errno == EINTR);
+  return size < 0 ? 0 : static_cast<size_t>(size);
 }
 
 void Show(int input, int output) {
-  constexpr char kKept[] = "\n\t";
   const std::string before = CanRedraw(output) ? kEraseRest : "";  // a progress line, for example
-  std::string pending;
-  char chunk[4096];
-  for (;;) {
-    const ssize_t got = read(input, chunk, sizeof(chunk));
-    if (got < 0 && errno == EINTR) {
-      continue;
+  std::string line;
+  while (const size_t size = AwaitMessage(input)) {
+    const size_t begun = line.size();
+    line.resize(begun + size);
+    const ssize_t got = recv(input, &line[begun], size, 0);
+    line.resize(begun + (got < 0 ? 0 : static_cast<size_t>(got)));
+    // The C library writes a long line in two: so many of its blocks, and the rest.
+    if (size % kBlockBytes != 0) {
+      WriteAll(output, before + Safe(line));
+      line.clear();
     }
-    if (got <= 0) {
-      break;
-    }
-    pending.append(chunk, static_cast<size_t>(got));
-    const size_t showable = ShowableBytes(pending);
-    if (showable > 0) {
-      WriteAll(output, before + Printable(std::string_view(pending).substr(0, showable), kKept));
-    }
-    pending.erase(0, showable);
   }
-  WriteAll(output, Printable(pending, kKept));
+  WriteAll(output, Safe(line));
 }
 
 // The filter ends when the last process that could write to it has ended, and not before: a key
@@ -98,9 +95,12 @@ void Show(int input, int output) {
 
 SafeStderr::SafeStderr() {
   int ends[2];
-  if (pipe2(ends, O_CLOEXEC) != 0) {
-    Complain("cannot make a pipe");
+  if (socketpair(AF_UNIX, SOCK_SEQPACKET | SOCK_CLOEXEC, 0, ends) != 0) {
+    ComplainOfSystem("cannot make a pair of sockets");
     return;
+  }
+  for (const int option : {SO_SNDBUF, SO_SNDBUFFORCE}) {  // the second one is root's
+    setsockopt(ends[1], SOL_SOCKET, option, &kLongestMessageBytes, sizeof kLongestMessageBytes);
   }
   Start(ends[0], ends[1]);
   close(ends[0]);
@@ -110,12 +110,12 @@ SafeStderr::SafeStderr() {
 void SafeStderr::Start(int readEnd, int writeEnd) {
   original_ = fcntl(STDERR_FILENO, F_DUPFD_CLOEXEC, 0);
   if (original_ < 0) {
-    Complain("cannot keep the standard error output");
+    ComplainOfSystem("cannot keep the standard error output");
     return;
   }
   filter_ = fork();
   if (filter_ < 0) {
-    Complain("cannot start a process");
+    ComplainOfSystem("cannot start a process");
     return;
   }
   if (filter_ == 0) {
@@ -136,6 +136,16 @@ SafeStderr::~SafeStderr() {
   rawStderr = STDERR_FILENO;
   close(original_);
   waitpid(filter_, nullptr, 0);
+}
+
+void Complain(const std::string& line) {
+  Tell("quendelctl: " + line);
+}
+
+// One call, so that it stays one line. What is longer than any argument would not get through.
+void Tell(const std::string& line) {
+  constexpr size_t kMostBytes = 1 << 17;
+  WriteAll(STDERR_FILENO, line.substr(0, kMostBytes) + "\n");
 }
 
 int RawStderr() {

@@ -4,11 +4,17 @@
 
 #include <sys/types.h>
 
+#include <string>
+
 namespace quendelctl {
 
 // While one of these lives, what is written to the standard error output passes through a process
 // that escapes whatever could act on a terminal. The library's log lines quote the server's replies
 // as they came, and syslog() prints them without a look at them.
+//
+// It is a socket that keeps apart what each call writes, for syslog() writes a line by one call: a
+// line end within that was quoted, and is escaped as well. So whoever writes several lines of this
+// program's own writes them one by one.
 class SafeStderr {
  public:
   // Says so when the system has no descriptor or process left, and then changes nothing.
@@ -25,6 +31,12 @@ class SafeStderr {
   int original_ = -1;
   pid_t filter_ = -1;
 };
+
+// Writes a complaint of this program's own: one line, with the program's name before it.
+void Complain(const std::string& line);
+
+// Writes a line without the name.
+void Tell(const std::string& line);
 
 // Returns the descriptor of the standard error output itself, for what this program draws on a
 // terminal. Nothing from elsewhere may be written there.

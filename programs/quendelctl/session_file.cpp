@@ -2,6 +2,7 @@
 #include "session_file.h"
 
 #include <fcntl.h>
+#include <sys/stat.h>
 #include <syslog.h>
 #include <unistd.h>
 
@@ -82,6 +83,11 @@ SessionFile WriteSessionFile(const std::string& account, bool stopSshd) {
     return SessionFile::kFailed;
   }
   return SessionFile::kWritten;
+}
+
+bool IsSessionOpen() {
+  struct stat status = {};
+  return lstat(quendel::kRemoteConfFile, &status) == 0 || (errno != ENOENT && errno != ENOTDIR);
 }
 
 bool RemoveSessionFile() {

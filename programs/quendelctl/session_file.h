@@ -4,6 +4,8 @@
 
 #include <string>
 
+#include "base/paths.h"
+
 namespace quendelctl {
 
 // What came of writing the file.
@@ -13,6 +15,9 @@ enum class SessionFile { kWritten, kExists, kFailed };
 // survives a crash from then on. `account` must be a text that a key=value file holds as it is. A
 // failure is logged.
 SessionFile WriteSessionFile(const std::string& account, bool stopSshd);
+
+// Tells whether the file is there: whether a session is open.
+bool IsSessionOpen();
 
 // Removes the file. Returns false, with the reason logged, when it is still there.
 bool RemoveSessionFile();

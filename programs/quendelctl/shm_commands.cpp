@@ -49,9 +49,9 @@ int ReadSize(const std::string& text) {
 
 // The first byte of a segment tells how the exchange stands.
 std::string ReadBlock(const std::string& file) {
-  std::string block = ReadText("FILE", file);
-  if (block.empty() || block.size() > INT_MAX) {
-    throw CLI::ValidationError("FILE", "must have at least 1 and at most 2147483647 bytes");
+  std::string block = ReadText("FILE", file, INT_MAX);
+  if (block.empty()) {
+    throw CLI::ValidationError("FILE", "must have at least 1 byte");
   }
   if (block[0] == '\0' || block[0] == '*') {
     throw CLI::ValidationError("FILE", "must begin neither with a zero byte nor with *");

@@ -1,23 +1,30 @@
 // The command that carries out a request for files.
+#include <regex.h>
 #include <sys/random.h>
 
 #include <cerrno>
 #include <memory>
+#include <new>
 #include <system_error>
 
 #include "arguments.h"
 #include "command.h"
+#include "job.h"
+#include "limit_options.h"
 #include "quendel.h"
 
 namespace quendelctl {
 namespace {
 
 constexpr char kDebugArchive[] = "debug.dat";
+// The library's rule. It would refuse the whole request as well, and say less.
+constexpr char kDumpPattern[] = "^(/var/crash/|/volume[0-9]+/)@.+\\.core$";
 
 struct UploadArguments {
   std::string id;
   std::vector<std::string> files;
   std::vector<std::string> uuids;
+  LimitArguments limits;
 };
 
 // Returns a random UUID, of version 4 and variant 1.
@@ -49,12 +56,31 @@ Json::Value RequestFor(const UploadArguments& arguments) {
   return files;
 }
 
-Result Upload(const UploadArguments& arguments) {
-  const int id = ReadNumber("ID", arguments.id);
-  if (!arguments.uuids.empty() && arguments.uuids.size() != arguments.files.size()) {
-    throw CLI::ValidationError("--uuid", "needed once for each FILE, or not at all");
+bool IsCrashDump(const std::string& path) {
+  regex_t pattern;
+  if (regcomp(&pattern, kDumpPattern, REG_EXTENDED | REG_NOSUB) != 0) {
+    throw std::bad_alloc();
   }
-  const Json::Value files = RequestFor(arguments);
+  const bool matches = regexec(&pattern, path.c_str(), 0, nullptr, 0) == 0;
+  regfree(&pattern);
+  return matches;
+}
+
+// Nothing else of the device can be asked for.
+void CheckFiles(const std::vector<std::string>& files) {
+  constexpr size_t kMostFiles = 5;
+  for (const std::string& file : files) {
+    if (file != kDebugArchive && !IsCrashDump(file)) {
+      throw CLI::ValidationError(
+          "FILE", file + " is neither debug.dat nor /var/crash/@NAME.core or /volumeN/@NAME.core");
+    }
+  }
+  if (files.size() > kMostFiles) {
+    throw CLI::ValidationError("FILE", "at most five can be sent at once");
+  }
+}
+
+Result Upload(int id, const Json::Value& files) {
   Result result;
   result.success = QUENDELUploadFile(id, QUENDEL_ACT_PROGRESS_RUN, files) == 0;
   result.lines = {"Request " + std::to_string(id) +
@@ -67,6 +93,17 @@ Result Upload(const UploadArguments& arguments) {
   result.members["request_id"] = id;
   result.members["files"] = files;
   return result;
+}
+
+Result CarryOut(const UploadArguments& arguments) {
+  const int id = ReadNumber("ID", arguments.id);
+  CheckFiles(arguments.files);
+  if (!arguments.uuids.empty() && arguments.uuids.size() != arguments.files.size()) {
+    throw CLI::ValidationError("--uuid", "needed once for each FILE, or not at all");
+  }
+  const Json::Value files = RequestFor(arguments);
+  return RunJob(ReadLimits(arguments.limits), "the upload to end",
+                [&] { return Upload(id, files); });
 }
 
 Action DeclareUpload(CLI::App& command) {
@@ -86,7 +123,8 @@ Action DeclareUpload(CLI::App& command) {
                   "order; made up if not given")
       ->type_name("UUID")
       ->allow_extra_args(false);
-  return [arguments] { return Upload(*arguments); };
+  DeclareLimits(command, arguments->limits, WaitFor::kTransfer);
+  return [arguments] { return CarryOut(*arguments); };
 }
 
 }  // namespace
@@ -94,7 +132,11 @@ Action DeclareUpload(CLI::App& command) {
 std::vector<Command> UploadCommands() {
   return {
       {"upload", "Send the server files that it asked for",
-       R"(A file that cannot be prepared drops out: its reason is logged. When no file is left, the server
+       R"(A crash dump is /var/crash/@NAME.core or /volumeN/@NAME.core, where N is a number and NAME may
+have folders in it: nothing else of the device is ever sent. One path that is neither is a wrong
+command line, and nothing is sent.
+
+A file that cannot be prepared drops out: its reason is logged. When no file is left, the server
 is told so, which counts as success.
 
 Examples:

@@ -31,6 +31,9 @@ inline constexpr char kSupportSshDir[] = "/run/quendelhome/.ssh";
 inline constexpr char kAuthorizedKeysName[] = "authorized_keys";
 inline constexpr char kAuthorizedKeysFile[] = "/run/quendelhome/.ssh/authorized_keys";
 
+// The settings of quendelctl itself.
+inline constexpr char kQuendelctlConfFile[] = "/usr/arvo/etc/quendelctl.conf";
+
 // What the programs that run collections agree on: at most one run at a time.
 inline constexpr char kProgramsRunDir[] = "/run/quendel";
 inline constexpr char kCollectLockName[] = "collect.lock";

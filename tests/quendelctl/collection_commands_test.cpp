@@ -1,9 +1,7 @@
 // collect, perf, conf, tar and send: what they do, what they print and how they end.
 #include <gmock/gmock.h>
 #include <json/reader.h>
-#include <pty.h>
 #include <sys/stat.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -101,50 +99,6 @@ Output CollectAndSignal(const std::string& signalName, const std::string& argume
                " $tool; wait $tool");
 }
 
-// What a terminal of this width shows while quendelctl runs on it.
-struct Terminal {
-  int status = -1;
-  std::string shown;
-};
-
-Terminal OnTerminal(const std::vector<std::string>& arguments, unsigned short columns = 80,
-                    const char* kind = "xterm", const std::function<void(int)>& type = nullptr) {
-  winsize size = {};
-  size.ws_row = 24;
-  size.ws_col = columns;
-  int master = -1;
-  const pid_t child = forkpty(&master, nullptr, nullptr, &size);
-  if (child == 0) {
-    setenv("TERM", kind, 1);
-    signal(SIGINT, SIG_DFL);  // whoever started this test may ignore them
-    signal(SIGQUIT, SIG_DFL);
-    std::vector<const char*> argv = {QUENDELCTL};
-    for (const std::string& argument : arguments) {
-      argv.push_back(argument.c_str());
-    }
-    argv.push_back(nullptr);
-    execv(QUENDELCTL, const_cast<char**>(argv.data()));
-    _exit(127);
-  }
-  std::thread typist([&] {
-    if (type) {
-      type(master);
-    }
-  });
-  Terminal terminal;
-  char chunk[4096];
-  ssize_t got = 0;
-  while ((got = read(master, chunk, sizeof chunk)) > 0) {
-    terminal.shown.append(chunk, static_cast<size_t>(got));
-  }
-  typist.join();
-  int status = 0;
-  waitpid(child, &status, 0);
-  close(master);
-  terminal.status = WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
-  return terminal;
-}
-
 Json::Value FromJson(const std::string& text) {
   Json::Value value;
   EXPECT_TRUE(Json::Reader(Json::Features::strictMode()).parse(text, value)) << text;
@@ -239,6 +193,7 @@ TEST_F(CollectCommandTest, PrintsJson) {
   expected["logs_collected"].append("messages");
   expected["logs_collected"].append("second");  // once, though its archive came as well
   expected["logs_sent"] = Json::arrayValue;
+  expected["not_recorded"] = Json::arrayValue;
   EXPECT_EQ(FromJsonLine(output.out), FromJson(expected.toStyledString()));
   EXPECT_TRUE(Exists(files[0] + "/log/second.1.xz"));
 }
@@ -622,11 +577,11 @@ TEST_F(ConfCommandTest, ListsAsJson) {
   const Output output = Quendelctl({"conf", "list", "--json"});
   EXPECT_EQ(output.status, 1);  // because of zz
   const std::string inode = std::to_string(status.st_ino);
-  EXPECT_EQ(FromJsonLine(output.out),
-            FromJson(R"({"success":false,"collectors":[{"file":"quendel.log.messages","kind":"log",
+  EXPECT_EQ(FromJsonLine(output.out), FromJson(R"({"success":false,"reason":"failed",
+                "error":"Not every collector can be read.","collectors":[{"file":"quendel.log.messages","kind":"log",
                 "name":"messages","path":"/volume1/messages","state":"same","offset":13,
                 "lag_bytes":5,"last_hash_known":true,"recorded_inode":)" +
-                     inode + R"(,"present_inode":)" + inode + R"(},
+                                               inode + R"(,"present_inode":)" + inode + R"(},
                 {"file":"quendel.udc.raid","kind":"udc","name":"raid","path":"/volume1/raid",
                 "state":"ready","last_hash_known":true},
                 {"file":"quendel.udc.zz","kind":"udc","state":"no-collector"}]})"));
@@ -705,7 +660,7 @@ TEST_F(ConfCommandTest, RejectsANameThatIsNotOneCollector) {
   ExpectUsageError({"conf", "reset", "../quendel.conf"}, "NAME: no collector is called");
   ExpectUsageError({"conf", "reset"}, "NAME: either a NAME or --all is needed");
   ExpectUsageError({"conf", "reset", "raid", "--all"}, "NAME: either a NAME or --all is needed");
-  ExpectUsageError({"conf"}, "list or reset is required");
+  ExpectUsageError({"conf"}, "conf: one of these commands is required: list, reset");
   ExpectUsageError({"conf", "list", "x"}, "The following argument was not expected: x");
   EXPECT_EQ(ReadFile(kMessages), settings);
 }

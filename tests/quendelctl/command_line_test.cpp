@@ -29,7 +29,10 @@ const std::vector<std::string> kCommands = {"heartbeat",
                                             "status",
                                             "history",
                                             "pause",
-                                            "resume"};
+                                            "resume",
+
+                                            "completion",
+                                            "help"};
 
 // Those of them that do something, and the commands of the others.
 const std::vector<std::vector<std::string>> kDoers = {{"heartbeat"},
@@ -126,6 +129,62 @@ TEST(CommandLineTest, RejectsWhatACommandDoesNotTake) {
   ExpectUsageError({"facts", "--nosuch"}, "The following argument was not expected: --nosuch");
   ExpectUsageError({"heartbeat", "version"}, "The following argument was not expected: version");
   EXPECT_THAT(Requests(), IsEmpty());
+}
+
+TEST(CommandLineTest, ProposesWhatMayHaveBeenMeant) {
+  const struct {
+    std::vector<std::string> words;
+    const char* meant;
+  } kRows[] = {{{"heartbaet"}, "heartbeat"},      {{"fact"}, "facts"},
+               {{"comp"}, "completion"},          {{"conf", "lsit"}, "list"},
+               {{"collect", "--sned"}, "--send"}, {{"conf", "list", "--jsn"}, "--json"},
+               {{"--versoin"}, "--version"}};
+  for (const auto& row : kRows) {
+    const Output output = Quendelctl(row.words);
+    EXPECT_EQ(output.status, 2);
+    EXPECT_EQ(output.err,
+              "quendelctl: The following argument was not expected: " + row.words.back() +
+                  "\nDid you mean " + row.meant + "?\nRun with --help for more information.\n");
+  }
+}
+
+TEST(CommandLineTest, ShowsHelpInEveryWayThatIsTried) {
+  EXPECT_EQ(Quendelctl({"help"}).out, Quendelctl({"--help"}).out);
+  EXPECT_EQ(Quendelctl({"help", "conf", "reset"}).out, Quendelctl({"conf", "reset", "-h"}).out);
+  ExpectUsageError({"help", "nosuch"}, "COMMAND: there is no command nosuch");
+  EXPECT_EQ(Quendelctl({"-V"}).out, Quendelctl({"--version"}).out);
+}
+
+TEST(CommandLineTest, TakesJsonInFrontAsWell) {
+  const std::string expected = Quendelctl({"version", "--json"}).out;
+  EXPECT_EQ(Quendelctl({"--json", "version"}).out, expected);
+  const std::string list = Quendelctl({"conf", "list", "--json"}).out;
+  EXPECT_EQ(Quendelctl({"conf", "--json", "list"}).out, list);
+  EXPECT_EQ(Quendelctl({"--json", "conf", "list"}).out, list);
+}
+
+TEST(CommandLineTest, TellsTheCommandsOfAGroup) {
+  ExpectUsageError({"conf"}, "conf: one of these commands is required: list, reset");
+  ExpectUsageError({"remote"}, "remote: one of these commands is required: create, close, key");
+  ExpectUsageError({"shm"}, "shm: one of these commands is required: alloc, send, receive");
+}
+
+TEST(CommandLineTest, RejectsJsonThatIsNestedTooDeep) {
+  const std::string deep = "{\"a\":" + std::string(5000, '[') + std::string(5000, ']') + "}";
+  for (const std::vector<std::string>& words :
+       {std::vector<std::string>{"event", "enable", "--info"},
+        {"progress", "1", "done", "--details"},
+        {"collect", "--perf"}}) {
+    std::vector<std::string> arguments = words;
+    arguments.push_back(deep);
+    ExpectUsageError(arguments, words.back() + ": not JSON: nested deeper than 1000 levels");
+  }
+  EXPECT_THAT(Requests(), IsEmpty());
+}
+
+TEST(CommandLineTest, RejectsAFileThatHasNoEnd) {
+  ExpectUsageError({"event", "enable", "--info", "/dev/zero"},
+                   "--info: /dev/zero is longer than 67108864 bytes");
 }
 
 TEST(CommandLineTest, NeedsEachArgument) {

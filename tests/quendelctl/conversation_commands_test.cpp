@@ -88,7 +88,10 @@ TEST_F(HeartbeatCommandTest, FailsWhenTheServerDeclines) {
     const bool json = std::string(form) == "--json";
     const Output output = json ? Quendelctl({"heartbeat", "--json"}) : Quendelctl({"heartbeat"});
     EXPECT_EQ(output.status, 1);
-    EXPECT_EQ(output.out, json ? "{\"success\":false}\n" : "The heartbeat failed.\n");
+    EXPECT_EQ(
+        output.out,
+        json ? "{\"error\":\"The heartbeat failed.\",\"reason\":\"failed\",\"success\":false}\n"
+             : "The heartbeat failed.\n");
     EXPECT_THAT(output.err, ContainsRegex("^quendelctl: quendel_heartbeat:[0-9]+ Failed to send "
                                           "heartbeat, server return failed\\. \\[.*\\]\n$"));
   }
@@ -158,7 +161,7 @@ TEST_F(EventCommandTest, RejectsADescriptionThatIsNotJson) {
   for (const char* info : {"{", "{}x", "{\"a\":1,}", "/tmp/bad.json", "/dev/null"}) {
     const Output output = Quendelctl({"event", "enable", "--info", info});
     EXPECT_EQ(output.status, 2) << info;
-    EXPECT_THAT(output.err, ContainsRegex("^quendelctl: --info: not JSON: [^\n]+\n[^\n]+\n"
+    EXPECT_THAT(output.err, ContainsRegex("^quendelctl: --info: not JSON: [^\n]+\n"
                                           "Run with --help for more information\\.\n$"))
         << info;
   }
@@ -210,7 +213,9 @@ TEST_F(EventCommandTest, HasNoReplyWhenTheServerSentNoJson) {
   Answer({.body = "<html>"});
   const Output json = Quendelctl({"event", "reboot", "--json"});
   EXPECT_EQ(json.status, 1);
-  EXPECT_EQ(json.out, "{\"event\":\"reboot\",\"reply\":null,\"success\":false}\n");
+  EXPECT_EQ(json.out,
+            "{\"error\":\"The event reboot was not accepted.\",\"event\":\"reboot\","
+            "\"reason\":\"failed\",\"reply\":null,\"success\":false}\n");
 }
 
 TEST_F(EventCommandTest, FailsWithoutAnAccount) {
@@ -295,5 +300,7 @@ TEST_F(ProgressCommandTest, FailsWhenTheServerDeclines) {
   Answer({.body = R"({"success":false})"});
   const Output json = Quendelctl({"progress", "17", "done", "--json"});
   EXPECT_EQ(json.status, 1);
-  EXPECT_EQ(json.out, "{\"progress\":0,\"request_id\":17,\"success\":false}\n");
+  EXPECT_EQ(json.out,
+            "{\"error\":\"The server did not get or accept the report on request 17: done.\","
+            "\"progress\":0,\"reason\":\"failed\",\"request_id\":17,\"success\":false}\n");
 }

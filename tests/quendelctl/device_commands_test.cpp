@@ -47,7 +47,9 @@ TEST(TestConnectionCommandTest, FailsWhenTheServerCannotBeReached) {
   EXPECT_THAT(text.err, HasSubstr("Failed to get IP address of target hostname: nowhere.test\n"));
   const Output json = Quendelctl({"test-connection", "--json"});
   EXPECT_EQ(json.status, 1);
-  EXPECT_EQ(json.out, "{\"host\":\"nowhere.test\",\"success\":false}\n");
+  EXPECT_EQ(json.out,
+            "{\"error\":\"The server nowhere.test cannot be reached.\",\"host\":\"nowhere.test\","
+            "\"reason\":\"failed\",\"success\":false}\n");
 }
 
 TEST(TestConnectionCommandTest, PrintsJson) {
@@ -79,7 +81,7 @@ TEST(FactsCommandTest, PrintsJson) {
   facts.removeMember("local_time");
   EXPECT_EQ(facts, FromJsonLine("{\"contact\":[],\"model\":\"TEST-1\",\"server_host\":"
                                 "\"support.test\",\"service_enabled\":false,\"success\":true,"
-                                "\"version\":\"HMX 3.2-2044\"}\n"));
+                                "\"version\":\"HMX 3.2-2044\",\"warnings\":[]}\n"));
 }
 
 TEST(FactsCommandTest, ShowsTheOtherFactsWhenOneIsUnknown) {

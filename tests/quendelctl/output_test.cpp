@@ -81,9 +81,39 @@ TEST_F(OutputTest, KeepsCharactersOfALongLogLineWhole) {
   EXPECT_THAT(Quendelctl({"heartbeat"}).err, HasSubstr("[" + reply + "]\n"));
 }
 
-TEST_F(OutputTest, KeepsTheLinesOfAReplyInTheLog) {
+TEST_F(OutputTest, LetsAReplyForgeNoLineOfTheLog) {
   Answer({.body = "<a>\n\t<b>\n</a>"});
-  EXPECT_THAT(Quendelctl({"heartbeat"}).err, HasSubstr("[<a>\n\t<b>\n</a>]\n"));
+  EXPECT_THAT(Quendelctl({"heartbeat"}).err, HasSubstr("[<a>\\x0a\t<b>\\x0a</a>]\n"));
+}
+
+// The C library writes a line that is longer than its buffer in parts of these many bytes.
+TEST_F(OutputTest, LetsNoLongReplyForgeALineEither) {
+  constexpr size_t kPart = 4096;
+  const std::string before = "quendelctl: quendel_post_data_to_server:";
+  for (size_t lead = 0; lead < 120; lead += 1) {
+    std::string reply(kPart - lead - 1, 'x');
+    reply += "\nquendelctl: all is well\n" + std::string(kPart, 'y');
+    Answer({.body = reply});
+    const std::string err = Quendelctl({"heartbeat"}).err;
+    EXPECT_THAT(err, Not(HasSubstr("\nquendelctl: all"))) << lead;
+    EXPECT_THAT(err, HasSubstr("\\x0aquendelctl: all is well\\x0a")) << lead;
+  }
+}
+
+TEST_F(OutputTest, EscapesWhatIsNotSeen) {
+  const char* const kUnseen[] = {"\u00ad", "\u034f",     "\u061c",    "\u115f", "\u17b4",
+                                 "\u180e", "\u200b",     "\u200f",    "\u2028", "\u2060",
+                                 "\u2066", "\u206f",     "\u3164",    "\ufeff", "\uffa0",
+                                 "\ufff9", "\U000e0001", "\U000e007f"};
+  std::string reply = "{\"success\":true,\"actions\":[\"";
+  for (const char* const character : kUnseen) {
+    reply += character;
+  }
+  Answer({.body = reply + "\"]}"});
+  EXPECT_EQ(Quendelctl({"heartbeat"}).out,
+            "The server has queued 1 action:\n  \"\\u{ad}\\u{34f}\\u{61c}\\u{115f}\\u{17b4}"
+            "\\u{180e}\\u{200b}\\u{200f}\\u{2028}\\u{2060}\\u{2066}\\u{206f}\\u{3164}"
+            "\\u{feff}\\u{ffa0}\\u{fff9}\\u{e0001}\\u{e007f}\"\n");
 }
 
 TEST_F(OutputTest, EscapesTheArgumentsOfAComplaint) {
@@ -172,7 +202,7 @@ TEST_F(OutputTest, FailsWhenTheLogLinesCannotBeMadeSafe) {
   const Output noPipe = Shell("ulimit -n 4; $quendelctl version");
   EXPECT_EQ(noPipe.status, 1);
   EXPECT_THAT(noPipe.out, IsEmpty());
-  EXPECT_EQ(noPipe.err, "quendelctl: cannot make a pipe: Too many open files\n");
+  EXPECT_EQ(noPipe.err, "quendelctl: cannot make a pair of sockets: Too many open files\n");
   const Output noCopy = Shell("ulimit -n 5; $quendelctl version");
   EXPECT_EQ(noCopy.status, 1);
   EXPECT_THAT(noCopy.out, IsEmpty());

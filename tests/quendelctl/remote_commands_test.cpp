@@ -5,6 +5,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <cstring>
 #include <set>
 
 #include "quendelctl/run_quendelctl.h"
@@ -24,6 +25,8 @@ namespace {
 constexpr char kConf[] = "/usr/arvo/etc/quendel.remote.conf";
 constexpr char kSettingsFolder[] = "/usr/arvo/etc";
 constexpr char kKeyFile[] = "/tmp/staff.pub";
+constexpr char kPublicKey[] =
+    "ssh-ed25519 AAAAC3NzaC1lZDI1NTE5AAAAIOt9wMP7oE+lxk5sv+/pfMDOPQmjrvOoYuaJp+dAnEwU staff\n";
 constexpr char kAuthorizedKeys[] = "/run/quendelhome/.ssh/authorized_keys";
 constexpr char kTool[] = "/usr/arvo/sbin/arvocloudserviceauth";
 constexpr char kNotOpened[] = "No remote session was opened.\n";
@@ -32,7 +35,7 @@ class RemoteCommandTest : public testing::Test {
  protected:
   void SetUp() override {
     SetIdentity();
-    WriteFile(kKeyFile, "ssh-ed25519 AAAA staff\n");
+    WriteFile(kKeyFile, kPublicKey);
   }
 };
 
@@ -63,7 +66,7 @@ TEST_F(RemoteCreateCommandTest, OpensASession) {
   EXPECT_EQ(output.out, "The remote session is open for the account support.\n");
   EXPECT_THAT(output.err, IsEmpty());
   EXPECT_TRUE(AccountExists("support"));
-  EXPECT_EQ(ReadFile(kAuthorizedKeys), "ssh-ed25519 AAAA staff\n");
+  EXPECT_EQ(ReadFile(kAuthorizedKeys), kPublicKey);
   EXPECT_EQ(ReadFile(kConf), "remote_account=support\nstop_sshd_after_complete=no\n");
   EXPECT_THAT(Requests(), IsEmpty());
 }
@@ -77,10 +80,10 @@ TEST_F(RemoteCreateCommandTest, NotesThatTheSshServiceIsToBeStopped) {
 
 TEST_F(RemoteCreateCommandTest, PrintsJson) {
   const Output output =
-      Quendelctl({"remote", "create", "support", "-", "--stop-sshd", "--json"}, "key");
+      Quendelctl({"remote", "create", "support", "-", "--stop-sshd", "--json"}, kPublicKey);
   EXPECT_EQ(output.status, 0);
   EXPECT_EQ(output.out, "{\"stop_sshd\":true,\"success\":true,\"user\":\"support\"}\n");
-  EXPECT_EQ(ReadFile(kAuthorizedKeys), "key");
+  EXPECT_EQ(ReadFile(kAuthorizedKeys), kPublicKey);
 }
 
 TEST_F(RemoteCreateCommandTest, LeavesOnlyTheSessionFileAndThatForRoot) {
@@ -103,7 +106,10 @@ TEST_F(RemoteCreateCommandTest, RefusesASecondSession) {
             std::string("quendelctl: a remote session is open already: ") + kConf + " exists\n");
   const Output json = Quendelctl({"remote", "create", "support", kKeyFile, "--json"});
   EXPECT_EQ(json.status, 1);
-  EXPECT_EQ(json.out, "{\"stop_sshd\":false,\"success\":false,\"user\":\"support\"}\n");
+  EXPECT_EQ(
+      json.out,
+      "{\"error\":\"No remote session was opened.\",\"reason\":\"failed\",\"stop_sshd\":false,"
+      "\"success\":false,\"user\":\"support\"}\n");
   EXPECT_EQ(ReadFile(kConf), "remote_account=first\n");
   EXPECT_EQ(Names(kSettingsFolder), names);
   EXPECT_FALSE(AccountExists("support"));
@@ -182,9 +188,11 @@ TEST_F(RemoteCreateCommandTest, SaysWhenTheSessionHasToBeEnded) {
 }
 
 TEST_F(RemoteCreateCommandTest, ClearsAwayWhatCouldNotBeMadeWhole) {
-  WriteFile("/tmp/long.pub", std::string(200'000, 'k'));  // longer than a file may be below
+  // Longer than a file may be below.
+  WriteFile("/tmp/long.pub",
+            std::string(kPublicKey, strlen(kPublicKey) - 1) + std::string(15'000, '-'));
   const Output output =
-      Shell("trap '' XFSZ; ulimit -f 200; $quendelctl remote create support /tmp/long.pub");
+      Shell("trap '' XFSZ; ulimit -f 10; $quendelctl remote create support /tmp/long.pub");
   EXPECT_EQ(output.status, 1);
   EXPECT_EQ(output.out, kNotOpened);
   EXPECT_THAT(output.err, HasSubstr("Failed to update '/run/quendelhome/.ssh/authorized_keys'"));
@@ -208,15 +216,16 @@ TEST_F(RemoteCreateCommandTest, RejectsAWrongCommandLine) {
       {{"a b", kKeyFile}, "USER: not a name for an account: a b\n"},
       {{"a=b", kKeyFile}, "USER: not a name for an account: a=b\n"},
       {{"a\"", kKeyFile}, "USER: not a name for an account: a\"\n"},
-      {{"a\nremote_account=root", kKeyFile}, "USER: not a name for an account: a\nremote_account"},
+      {{"a\nremote_account=root", kKeyFile},
+       "USER: not a name for an account: a\\x0aremote_account"},
       {{"\xc3\xa9", kKeyFile}, "USER: not a name for an account: \xc3\xa9\n"},
       {{"--", "-a", kKeyFile}, "USER: not a name for an account: -a\n"},
       {{"Upper", kKeyFile}, "USER: not a name for an account: Upper\n"},
       {{"1st", kKeyFile}, "USER: not a name for an account: 1st\n"},
       {{std::string(33, 'a'), kKeyFile}, "USER: not a name for an account: aaa"},
       {{"support", "/tmp/missing"}, "KEYFILE: cannot read /tmp/missing: No such file"},
-      {{"support", "/tmp/nul.pub"}, "KEYFILE: not a text: /tmp/nul.pub\n"},
-      {{"support", "/tmp/private"}, "KEYFILE: holds a private key: /tmp/private\n"},
+      {{"support", "/tmp/nul.pub"}, "KEYFILE: /tmp/nul.pub is not a text\n"},
+      {{"support", "/tmp/private"}, "KEYFILE: /tmp/private holds a private key\n"},
   };
   for (const Row& row : rows) {
     std::vector<std::string> arguments = {"remote", "create"};
@@ -228,6 +237,81 @@ TEST_F(RemoteCreateCommandTest, RejectsAWrongCommandLine) {
   }
   EXPECT_FALSE(Exists(kConf));
   EXPECT_FALSE(Exists("/run/quendelhome"));
+}
+
+// The key would open the account, so nothing but one plain key will do.
+TEST_F(RemoteCreateCommandTest, RejectsWhatIsNotOnePublicKey) {
+  const std::string key(kPublicKey, strlen(kPublicKey) - 1);
+  const std::string neither = " is not a public key, or one with options\n";
+  const struct {
+    std::string text;
+    std::string complaint;
+  } kRows[] = {
+      {"", neither},
+      {"\n", neither},
+      {"key", neither},
+      {"ssh-ed25519", neither},
+      {"ssh-ed25519 AAAA staff\n", neither},
+      {"no-pty " + key, neither},
+      {"command=\"sh\" " + key, neither},
+      {"# comment " + key, neither},
+      {"ssh-ed25519-cert-v01@openssh.com AAAA", neither},
+      {key + "\n" + key + "\n", " has more than one line: one public key is needed\n"},
+      {key + "\n\n", " has more than one line: one public key is needed\n"},
+      {key + "\r\n", " is not a text\n"},
+      {key + "\x1b[2J", " is not a text\n"},
+      {key + std::string(20'000, ' '), " is longer than 16384 bytes\n"},
+  };
+  for (const auto& row : kRows) {
+    WriteFile("/tmp/a.pub", row.text);
+    const Output file = Quendelctl({"remote", "create", "support", "/tmp/a.pub"});
+    EXPECT_EQ(file.status, 2) << row.text;
+    EXPECT_THAT(file.err, StartsWith("quendelctl: KEYFILE: /tmp/a.pub" + row.complaint))
+        << row.text;
+    const Output input = Quendelctl({"remote", "create", "support", "-"}, row.text);
+    EXPECT_EQ(input.status, 2) << row.text;
+    EXPECT_THAT(input.err, StartsWith("quendelctl: KEYFILE: the standard input" + row.complaint));
+  }
+  EXPECT_FALSE(Exists(kConf));
+}
+
+TEST_F(RemoteCreateCommandTest, RejectsAKeyFileThatIsNoPlainFileOfTheCaller) {
+  ASSERT_EQ(mkfifo("/tmp/fifo", 0600), 0);
+  WriteFile("/tmp/other", kPublicKey);
+  ASSERT_EQ(chown("/tmp/other", 1234, 1234), 0);
+  ASSERT_EQ(symlink("/tmp/other", "/tmp/link"), 0);
+  const struct {
+    const char* file;
+    const char* complaint;
+  } kRows[] = {{"/dev/zero", " is not a file\n"},
+               {"/dev/null", " is not a file\n"},
+               {"/tmp", " is not a file\n"},
+               {"/tmp/fifo", " is not a file\n"},
+               {"/tmp/link", " is a link to what somebody else owns\n"}};
+  for (const auto& row : kRows) {
+    const Output output = Quendelctl({"remote", "create", "support", row.file});
+    EXPECT_EQ(output.status, 2);
+    EXPECT_THAT(output.err,
+                StartsWith(std::string("quendelctl: KEYFILE: ") + row.file + row.complaint));
+  }
+  EXPECT_FALSE(Exists(kConf));
+  ASSERT_EQ(symlink(kKeyFile, "/tmp/own"), 0);
+  EXPECT_EQ(Quendelctl({"remote", "create", "support", "/tmp/own"}).status, 0);
+}
+
+TEST_F(RemoteCreateCommandTest, ReadsOfTheStandardInputNoMoreThanAKeyMayHave) {
+  const Output output = Shell("$quendelctl remote create support - </dev/zero");
+  EXPECT_EQ(output.status, 2);
+  EXPECT_THAT(output.err, HasSubstr("the standard input is longer than 16384 bytes"));
+}
+
+TEST_F(RemoteCreateCommandTest, TakesNoKeyThatNobodyCouldExamine) {
+  ASSERT_EQ(Shell("mount --bind /dev/null /usr/bin/ssh-keygen").status, 0);
+  const Output output = Quendelctl({"remote", "create", "support", kKeyFile});
+  EXPECT_EQ(output.status, 1);
+  EXPECT_THAT(output.err,
+              HasSubstr("the key could not be examined: cannot start /usr/bin/ssh-keygen"));
+  EXPECT_FALSE(Exists(kConf));
 }
 
 TEST_F(RemoteCreateCommandTest, TakesANameOfEveryLengthThatAnAccountMayHave) {
@@ -270,14 +354,16 @@ TEST_F(RemoteCloseCommandTest, PrintsJson) {
   EXPECT_EQ(done.out, "{\"progress\":0,\"request_id\":17,\"success\":true}\n");
   const Output failed = Quendelctl({"remote", "close", "17", "--failed", "--json"});
   EXPECT_EQ(failed.status, 1);
-  EXPECT_EQ(failed.out, "{\"progress\":-1,\"request_id\":17,\"success\":false}\n");
+  EXPECT_EQ(failed.out,
+            "{\"error\":\"No remote session is open.\",\"progress\":-1,\"reason\":\"no-session\","
+            "\"request_id\":17,\"success\":false}\n");
 }
 
 TEST_F(RemoteCloseCommandTest, FailsWithoutASession) {
   const Output output = Quendelctl({"remote", "close", "17"});
   EXPECT_EQ(output.status, 1);
-  EXPECT_EQ(output.out, "The remote session was not closed, or not to its end.\n");
-  EXPECT_THAT(output.err, HasSubstr("Failed to get quendel key configuration file\n"));
+  EXPECT_EQ(output.out, "No remote session is open.\n");
+  EXPECT_THAT(output.err, IsEmpty());
   EXPECT_THAT(Requests(), IsEmpty());
 }
 
@@ -354,7 +440,8 @@ TEST_F(RemoteKeyCommandTest, FailsWithoutAKey) {
   EXPECT_THAT(text.err, HasSubstr("Failed to read relay status ()"));
   const Output json = Quendelctl({"remote", "key", "--json"});
   EXPECT_EQ(json.status, 1);
-  EXPECT_EQ(json.out, "{\"success\":false}\n");
+  EXPECT_EQ(json.out,
+            "{\"error\":\"There is no session key.\",\"reason\":\"failed\",\"success\":false}\n");
 }
 
 TEST_F(RemoteKeyCommandTest, ShowsNoKeyThatIsCut) {

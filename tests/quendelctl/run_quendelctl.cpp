@@ -4,12 +4,15 @@
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <json/reader.h>
+#include <pty.h>
 #include <spawn.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <algorithm>
+#include <csignal>
 #include <cstdlib>
+#include <thread>
 
 #include "support/appliance.h"
 
@@ -52,6 +55,44 @@ Output Quendelctl(const std::vector<std::string>& arguments, const std::string& 
 Output Shell(const std::string& command) {
   setenv("quendelctl", QUENDELCTL, 1);
   return Run("/bin/sh", {"-c", command}, "");
+}
+
+Terminal OnTerminal(const std::vector<std::string>& arguments, unsigned short columns,
+                    const char* kind, const std::function<void(int)>& type) {
+  winsize size = {};
+  size.ws_row = 24;
+  size.ws_col = columns;
+  int master = -1;
+  const pid_t child = forkpty(&master, nullptr, nullptr, &size);
+  if (child == 0) {
+    setenv("TERM", kind, 1);
+    signal(SIGINT, SIG_DFL);  // whoever started this test may ignore them
+    signal(SIGQUIT, SIG_DFL);
+    std::vector<const char*> argv = {QUENDELCTL};
+    for (const std::string& argument : arguments) {
+      argv.push_back(argument.c_str());
+    }
+    argv.push_back(nullptr);
+    execv(QUENDELCTL, const_cast<char**>(argv.data()));
+    _exit(127);
+  }
+  std::thread typist([&] {
+    if (type) {
+      type(master);
+    }
+  });
+  Terminal terminal;
+  char chunk[4096];
+  ssize_t got = 0;
+  while ((got = read(master, chunk, sizeof chunk)) > 0) {
+    terminal.shown.append(chunk, static_cast<size_t>(got));
+  }
+  typist.join();
+  int status = 0;
+  waitpid(child, &status, 0);
+  close(master);
+  terminal.status = WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
+  return terminal;
 }
 
 Json::Value FromJsonLine(const std::string& line) {

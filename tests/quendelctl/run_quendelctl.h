@@ -4,6 +4,7 @@
 
 #include <json/value.h>
 
+#include <functional>
 #include <string>
 #include <vector>
 
@@ -20,6 +21,15 @@ Output Quendelctl(const std::vector<std::string>& arguments, const std::string& 
 
 // Runs a shell command that finds the program as $quendelctl.
 Output Shell(const std::string& command);
+
+// What a terminal of this width shows while quendelctl runs on it. `type` may write to it
+// meanwhile.
+struct Terminal {
+  int status = -1;
+  std::string shown;
+};
+Terminal OnTerminal(const std::vector<std::string>& arguments, unsigned short columns = 80,
+                    const char* kind = "xterm", const std::function<void(int)>& type = nullptr);
 
 // Reads a line that must be one JSON object in ASCII with a line end.
 Json::Value FromJsonLine(const std::string& line);

@@ -69,7 +69,10 @@ TEST(ShmAllocCommandTest, FailsForASegmentOfAnotherSize) {
   EXPECT_THAT(text.err, HasSubstr("Failed to create the segment, errno: Invalid argument\n"));
   const Output held = Quendelctl({"shm", "alloc", "0x51", "9", "--hold", "--json"});
   EXPECT_EQ(held.status, 1);
-  EXPECT_EQ(held.out, "{\"key\":81,\"size\":9,\"success\":false}\n");
+  EXPECT_EQ(
+      held.out,
+      "{\"error\":\"The segment could not be made.\",\"key\":81,\"reason\":\"failed\",\"size\":9,"
+      "\"success\":false}\n");
 }
 
 TEST(ShmAllocCommandTest, HoldsTheSegmentUntilASignal) {
@@ -142,7 +145,10 @@ TEST(ShmReceiveCommandTest, FailsWithoutASegment) {
   EXPECT_EQ(ReadFile("/tmp/received"), "old");
   const Output json = Quendelctl({"shm", "receive", "0x51", "5", "--json"});
   EXPECT_EQ(json.status, 1);
-  EXPECT_EQ(json.out, "{\"key\":81,\"result\":-2,\"size\":5,\"success\":false}\n");
+  EXPECT_EQ(
+      json.out,
+      "{\"error\":\"There is no such segment of that size.\",\"key\":81,\"reason\":\"failed\","
+      "\"result\":-2,\"size\":5,\"success\":false}\n");
 }
 
 TEST(ShmSendCommandTest, SendsTheStandardInput) {
@@ -161,7 +167,10 @@ TEST(ShmSendCommandTest, FailsWithoutASegment) {
   EXPECT_THAT(text.err, HasSubstr(kNotFound));
   const Output json = Quendelctl({"shm", "send", "0x51", "--json"}, "hello");
   EXPECT_EQ(json.status, 1);
-  EXPECT_EQ(json.out, "{\"key\":81,\"result\":-2,\"size\":5,\"success\":false}\n");
+  EXPECT_EQ(
+      json.out,
+      "{\"error\":\"There is no such segment of that size.\",\"key\":81,\"reason\":\"failed\","
+      "\"result\":-2,\"size\":5,\"success\":false}\n");
 }
 
 TEST(ShmSendCommandTest, FailsWhenTheBlockIsLargerThanTheSegment) {
@@ -193,7 +202,7 @@ TEST(ShmCommandTest, RejectsAWrongCommandLine) {
     const char* complaint;
   };
   const Row rows[] = {
-      {{}, "A command is required"},
+      {{}, "shm: one of these commands is required: alloc, send, receive"},
       {{"free"}, "not expected: free"},
       {{"alloc"}, "KEY is required"},
       {{"alloc", "1"}, "SIZE is required"},

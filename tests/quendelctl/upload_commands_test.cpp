@@ -10,6 +10,7 @@ using namespace quendel::test;
 using testing::HasSubstr;
 using testing::IsEmpty;
 using testing::MatchesRegex;
+using testing::Not;
 using testing::SizeIs;
 
 namespace {
@@ -105,23 +106,39 @@ TEST_F(UploadCommandTest, TellsTheServerWhenNoFileIsLeft) {
               testing::ElementsAre("POST /action_progress/17/-3/a1/b2/S1 HTTP/1.1"));
 }
 
-TEST_F(UploadCommandTest, FailsForAFileThatMayNotBeSent) {
-  const Output text = Quendelctl({"upload", "17", "/etc/passwd", "--uuid", "u"});
-  EXPECT_EQ(text.status, 1);
-  EXPECT_EQ(text.out, "Request 17 failed. It asked for:\n  u  coredump  /etc/passwd\n");
-  EXPECT_THAT(text.err, HasSubstr("Invalid file path '/etc/passwd'\n"));
-  const Output json = Quendelctl({"upload", "17", "/etc/passwd", "--json"});
-  EXPECT_EQ(json.status, 1);
-  EXPECT_EQ(FromJsonLine(json.out)["success"], false);
+TEST_F(UploadCommandTest, NamesTheFileThatMayNotBeSent) {
+  for (const std::string path :
+       {"/etc/passwd", "/var/crash/x.core", "/volume/@x.core", "/volume1/@x.core.gz",
+        "/tmp/@x.core", "@x.core", "/var/crash/@.cor", "debug.dat2"}) {
+    const Output output = Quendelctl({"upload", "17", kDump, path});
+    EXPECT_EQ(output.status, 2) << path;
+    EXPECT_THAT(output.out, IsEmpty());
+    EXPECT_EQ(output.err, "quendelctl: FILE: " + path +
+                              " is neither debug.dat nor /var/crash/@NAME.core or "
+                              "/volumeN/@NAME.core\nRun with --help for more information.\n");
+  }
   EXPECT_THAT(Requests(), IsEmpty());
 }
 
-TEST_F(UploadCommandTest, FailsForMoreThanFiveFiles) {
-  const Output output =
-      Quendelctl({"upload", "17", kDump, kDump, kDump, kDump, kDump, "debug.dat"});
-  EXPECT_EQ(output.status, 1);
-  EXPECT_THAT(output.err, HasSubstr("Upload files exceed the max limit\n"));
-  EXPECT_THAT(Requests(), IsEmpty());
+// What the program lets pass, the library takes as well.
+TEST_F(UploadCommandTest, HasTheLibrarysRuleOfThePaths) {
+  for (const std::string path : {"/var/crash/@missing.core", "/volume12/@a/missing.core",
+                                 "/volume1/@\n.core", "/var/crash/@..core"}) {
+    const Output output = Quendelctl({"upload", "17", path});
+    EXPECT_EQ(output.status, 0) << path;
+    EXPECT_THAT(output.err, Not(HasSubstr("Invalid file path")));
+  }
+  EXPECT_THAT(Quendelctl({"upload", "--help"}).out, HasSubstr("/volumeN/@NAME.core, where N is"));
+}
+
+TEST_F(UploadCommandTest, TakesFiveFilesAndNoMore) {
+  std::vector<std::string> arguments = {"upload", "17", kDump, kDump, kDump, kDump, kDump};
+  EXPECT_EQ(Quendelctl(arguments).status, 0);
+  arguments.emplace_back("debug.dat");
+  const Output output = Quendelctl(arguments);
+  EXPECT_EQ(output.status, 2);
+  EXPECT_THAT(output.err, HasSubstr("FILE: at most five can be sent at once\n"));
+  EXPECT_THAT(Requests(), SizeIs(1));
 }
 
 TEST_F(UploadCommandTest, FailsWhenTheServerDeclines) {
