@@ -90,6 +90,7 @@ void AsNobody(const Step& step) {
   ASSERT_EQ(seteuid(kNobody), 0);
   step();
   ASSERT_EQ(seteuid(0), 0);
+  ASSERT_EQ(chown("/tmp/quendel", 0, 0), 0);
 }
 
 // The most memory, in KiB, that this process has held at one time.
