@@ -14,7 +14,6 @@
 
 using namespace quendel::test;
 using testing::IsEmpty;
-using testing::Not;
 
 namespace {
 
@@ -110,8 +109,14 @@ class ReusedNumbersTest : public testing::TestWithParam<const char*> {
 INSTANTIATE_TEST_SUITE_P(FileSystems, ReusedNumbersTest, testing::Values("ext4", "xfs"),
                          [](const auto& type) { return std::string(type.param); });
 
+// XFS takes a moment to give the number of a removed file away again, so that a log may be lucky.
 TEST_P(ReusedNumbersTest, CostLinesWhenALogIsRotatedTwiceBetweenTwoRuns) {
-  EXPECT_THAT(MissingAfter("inode", 2, 3), Not(IsEmpty()));
+  constexpr int kMostAttempts = 20;
+  int attempts = 0;
+  while (attempts < kMostAttempts && MissingAfter("inode", 2, 3).empty()) {
+    ++attempts;
+  }
+  EXPECT_LT(attempts, kMostAttempts);
 }
 
 TEST_P(ReusedNumbersTest, CostNothingWhenALogIsRotatedOnceBetweenTwoRuns) {

@@ -295,7 +295,7 @@ TEST_P(IgnoredChildrenTest, TellThatASignalToTheGroupEndedThem) {
 }
 
 TEST_P(IgnoredChildrenTest, LoseTheirStatusWithTheirHelper) {
-  MakeProgram("kill -9 $PPID; sleep 0.1");
+  MakeProgram("sleep 0.5; kill -9 $PPID; sleep 0.1");  // once it has said that this was started
   EXPECT_EQ(RunProgram(), -1);
   EXPECT_EQ(ALIBCErrGet(), 0x0801);
   EXPECT_EQ(errno, ECHILD);
