@@ -3,6 +3,9 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <set>
+#include <sstream>
+
 #include "run_quendelctl.h"
 #include "support/appliance.h"
 
@@ -35,6 +38,34 @@ std::string InBash(const std::string& words) {
              "); COMP_CWORD=$((${#COMP_WORDS[@]} - 1)); "
              "_quendelctl; echo ${COMPREPLY[@]}'")
       .out;
+}
+
+// What the manual quotes in a command's section from where it comes to --json.
+std::set<std::string> MembersInManual(const std::string& command) {
+  const std::string manual = ReadFile("/quendel/source/docs/man/quendelctl.1");
+  const size_t begin = manual.find("\n.Ss " + command + "\n");
+  EXPECT_NE(begin, std::string::npos) << command;
+  const size_t end = manual.find("\n.S", begin + 1);
+  const size_t json = manual.find("\n.Fl -json\n", begin);
+  EXPECT_LT(json, end) << command;
+  std::istringstream lines(manual.substr(json, end - json));
+  std::set<std::string> members;
+  for (std::string line; std::getline(lines, line);) {
+    if (line.rfind(".Dq ", 0) == 0) {
+      members.insert(line.substr(4, line.find(' ', 4) - 4));
+    }
+  }
+  return members;
+}
+
+// Without those that every command has.
+std::set<std::string> MembersIn(const std::string& output) {
+  const std::vector<std::string> names = FromJsonLine(output).getMemberNames();
+  std::set<std::string> members(names.begin(), names.end());
+  for (const char* common : {"success", "error", "reason"}) {
+    members.erase(common);
+  }
+  return members;
 }
 
 // The same of an interactive zsh, by its key.
@@ -167,6 +198,43 @@ TEST_F(FactsWarningTest, SaysNothingWhereAllIsWell) {
   EXPECT_THAT(Quendelctl({"facts"}).out, Not(HasSubstr("Warning")));
   EXPECT_EQ(FromJsonLine(Quendelctl({"facts", "--json"}).out)["warnings"],
             Json::Value(Json::arrayValue));
+}
+
+TEST(ManualTest, NamesTheMembersOfJson) {
+  SetIdentity();
+  for (const std::string command : {"server", "test-connection", "facts", "version", "clean"}) {
+    EXPECT_EQ(MembersIn(Shell("$quendelctl " + command + " --json").out), [&] {
+      std::set<std::string> members = MembersInManual(command);
+      members.erase("held_by");  // only while a collection goes on
+      return members;
+    }()) << command;
+  }
+  EXPECT_EQ(MembersIn(Shell("$quendelctl shm alloc 0x51 10 --json").out),
+            MembersInManual("shm alloc"));
+  EXPECT_EQ(MembersIn(Shell("$quendelctl collect --json").out), [] {
+    std::set<std::string> members = MembersInManual("collect");
+    for (const char* busy : {"held_by", "process", "program"}) {
+      members.erase(busy);
+    }
+    return members;
+  }());
+}
+
+TEST(ManualTest, NamesTheMembersAndReasonsOfFailures) {
+  SetIdentity();
+  const std::string manual = ReadFile("/quendel/source/docs/man/quendelctl.1");
+  for (const char* command :
+       {"heartbeat", "event reboot", "progress 1 done", "send /nowhere", "tar /nowhere /tmp/x",
+        "upload 1 debug.dat", "remote close 1", "collect --send"}) {
+    const Output output = Shell(std::string("$quendelctl ") + command + " --json");
+    EXPECT_EQ(output.status, 1) << command;
+    const Json::Value told = FromJsonLine(output.out);
+    EXPECT_FALSE(told["error"].asString().empty()) << command;
+    EXPECT_THAT(manual, HasSubstr("\n.Dq " + told["reason"].asString())) << command;
+    for (const std::string& member : told.getMemberNames()) {
+      EXPECT_THAT(manual, HasSubstr("\n.Dq " + member)) << command;
+    }
+  }
 }
 
 TEST(CompletionCommandTest, CompletesInBash) {
