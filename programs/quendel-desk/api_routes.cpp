@@ -84,7 +84,7 @@ Answer GetDevices(ApiCall& call) {
 }
 
 std::string EnrolmentIn(const Json::Value& body) {
-  const std::string enrolment = TextMember(body, "enrolment");
+  std::string enrolment = TextMember(body, "enrolment");
   if (enrolment != "approved" && enrolment != "refused" && enrolment != "waiting") {
     throw ApiError(400, "\"enrolment\" is \"approved\", \"refused\" or \"waiting\"");
   }

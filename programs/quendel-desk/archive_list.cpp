@@ -14,7 +14,7 @@
 namespace quendeldesk {
 namespace {
 
-constexpr size_t kBlock = 64 * 1024;
+constexpr size_t kBlock = 64UL * 1024;
 constexpr long long kMostEntries = 20'000;
 constexpr int64_t kMostBytes = 4LL * 1024 * 1024 * 1024;  // unpacked, while a list is made
 constexpr size_t kMostPath = 4096;

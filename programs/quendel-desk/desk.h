@@ -14,7 +14,7 @@
 
 namespace quendeldesk {
 
-constexpr uint64_t kMiB = 1024 * 1024;
+constexpr uint64_t kMiB = 1024UL * 1024;
 
 struct Settings {
   std::string data;

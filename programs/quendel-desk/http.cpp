@@ -19,8 +19,8 @@
 namespace quendeldesk {
 namespace {
 
-constexpr size_t kConnectionMemory = 32 * 1024;
-constexpr size_t kBlock = 64 * 1024;
+constexpr size_t kConnectionMemory = 32UL * 1024;
+constexpr size_t kBlock = 64UL * 1024;
 constexpr unsigned kMostConnections = 1'000'000;  // the table counts them
 
 struct Request {

@@ -14,7 +14,7 @@
 namespace quendeldesk {
 namespace {
 
-constexpr size_t kBlock = 256 * 1024;
+constexpr size_t kBlock = 256UL * 1024;
 
 std::string HashOf(int file) {
   Sha256 hash;
