@@ -14,7 +14,7 @@ namespace {
 
 constexpr size_t kSha256Bytes = 32;
 constexpr time_t kDay = 24L * 60 * 60;
-constexpr time_t kYears = 20 * 365 * kDay;
+constexpr time_t kYears = 20L * 365 * kDay;
 
 void Require(int result, const char* what) {
   if (result < 0) {

@@ -56,7 +56,7 @@ Identity OwnIdentity(const std::string& folder, const std::string& host) {
   if (key) {
     throw std::runtime_error("there is " + keyFile + ", but no " + certificateFile);
   }
-  const Identity made = MakeIdentity(host);
+  Identity made = MakeIdentity(host);
   WriteSecret(certificateFile, made.certificate);
   WriteSecret(keyFile, made.key);
   return made;

@@ -80,6 +80,21 @@ TEST(StartCollectAndSendTest, CommitsNothingBeforeTheServerHasAnswered) {
   }
 }
 
+// docs/delivery-guarantee.md lists it.
+TEST(StartCollectAndSendTest, LinesAreLostWhenTheArchiveFindsNoPlaceInTheRequest) {
+  SetIdentity();
+  InstallCollectors();
+  const auto before = CollectorConf();
+  On("curl_formadd").Nth(1).Return(1);
+  EXPECT_EQ(CollectAndSend(1), 0);
+  ASSERT_THAT(Requests(), SizeIs(1));
+  EXPECT_THAT(Parts(Requests()[0]), SizeIs(1));
+  EXPECT_THAT(Log(),
+              ElementsAre(Logged("quendel_post_file_to_server",
+                                 "Failed to add curl form: '" + std::string(kArchive) + "'")));
+  EXPECT_NE(CollectorConf(), before);
+}
+
 TEST(StartCollectAndSendTest, CommitsNothingThatTheServerRefused) {
   SetIdentity();
   InstallCollectors();

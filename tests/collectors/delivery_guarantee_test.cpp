@@ -450,6 +450,16 @@ TEST(DeliveryGuaranteeTest, LinesAreLostOfALateLogThatIsEmptied) {
   EXPECT_FALSE(ArrivesLater("lost"));
 }
 
+TEST(DeliveryGuaranteeTest, LinesAreLostOfALateLogWhoseArchiveIsRemoved) {
+  InstallCollected("");
+  AppendFile(kLog, "lost\n");
+  Deliver();
+  EXPECT_FALSE(HasArrived("lost"));
+  Rotate(kLog);
+  RemoveFile(std::string(kLog) + ".1.xz");
+  EXPECT_FALSE(ArrivesLater("lost"));
+}
+
 TEST(DeliveryGuaranteeTest, LinesAreLateAfterAnInterruptedReset) {
   InstallCollected("one\n");
   On("ALIBCFileSetKeyValue").Nth(5).Return(-1);  // the inode number stays
