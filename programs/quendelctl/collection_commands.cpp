@@ -79,7 +79,7 @@ CollectLock::Result TakeLock(CollectLock& lock, bool wait, Clock::time_point dea
 WorkerEnd Collect(const WorkerLimits& limits, bool send, const Json::Value& series,
                   const CollectLock& lock, RunWatch& run) {
   Progress progress;
-  const WorkerEnd end = RunInWorker(
+  WorkerEnd end = RunInWorker(
       limits,
       [&] {
         lock.TakeOver();
