@@ -19,6 +19,7 @@ Action DeclareGroup(CLI::App& group, const std::vector<Command>& commands) {
   }
   group.require_subcommand(0, 1);
   std::vector<std::string> names;
+  names.reserve(commands.size());
   for (const Command& command : commands) {
     names.emplace_back(command.name);
   }

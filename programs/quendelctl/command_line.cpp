@@ -38,6 +38,7 @@ void RefuseEmptyValues(CLI::App& command) {
 }
 
 // Adds what every command takes, to this one and those below it.
+// NOLINTNEXTLINE(misc-no-recursion): commands are two deep.
 void AddCommonOptions(CLI::App& command, bool& json) {
   command.add_flag("--json", json, kJson);
   RefuseEmptyValues(command);

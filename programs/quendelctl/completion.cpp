@@ -60,6 +60,7 @@ void AddOption(const CLI::Option& option, Place& place) {
   }
 }
 
+// NOLINTNEXTLINE(misc-no-recursion): commands are two deep.
 void AddPlaces(const CLI::App& command, const std::string& path, std::vector<Place>& places) {
   Place place;
   place.path = path;

@@ -100,7 +100,8 @@ std::string DescribeHeartbeat(const Json::Value& heartbeat) {
 }
 
 std::string DescribeRun(const Json::Value& run) {
-  const std::string reason = run["reason"] == "" ? "" : ": " + run["reason"].asString();
+  const std::string told = run["reason"].asString();
+  const std::string reason = told.empty() ? "" : ": " + told;
   return LocalTime(run["started"]) + "  " + run["result"].asString() + "  " +
          run["bytes"].asString() + " bytes  (" + run["cause"].asString() + ")" + reason;
 }

@@ -131,8 +131,7 @@ Result AskSshKeygen(const std::string& key) {
 }  // namespace
 
 std::string ReadPublicKey(const std::string& file, const WorkerLimits& limits) {
-  const std::string text =
-      file == "-" ? ReadText(kArgument, file, kMostKeyBytes) : ReadPlainFile(file);
+  std::string text = file == "-" ? ReadText(kArgument, file, kMostKeyBytes) : ReadPlainFile(file);
   const std::string key = BareKey(file, text);
   const Result answer = RunJob(limits, "ssh-keygen", [&] { return AskSshKeygen(key); });
   if (!answer.success) {
