@@ -99,6 +99,7 @@ void Journal::SetFact(const std::string& key, const std::string& value) {
 std::vector<Journal::Taking> Journal::TakeRequests(const std::vector<NewRequest>& requests,
                                                    int64_t most) {
   std::vector<Taking> results;
+  results.reserve(requests.size());
   const int64_t now = time(nullptr);
   Transaction transaction(database_);
   for (const NewRequest& request : requests) {

@@ -79,24 +79,30 @@ int Run(const DaemonOptions& options) {
   return 0;
 }
 
-}  // namespace
-}  // namespace quendeld
-
-int main(int argc, char** argv) {
-  quendeld::OccupyStandardDescriptors();
+int Main(int argc, char** argv) {
+  OccupyStandardDescriptors();
   CLI::App app("quendeld - the daemon of the remote support service", "quendeld");
-  quendeld::DaemonOptions options;
-  options.settings = quendeld::kSettingsFile;
-  options.worker = quendeld::WorkerBesideMe();
+  DaemonOptions options;
+  options.settings = kSettingsFile;
+  options.worker = WorkerBesideMe();
   app.add_flag("--foreground", options.foreground, "Log to the standard error output as well");
   app.add_option("--worker", options.worker, "The program that does the work")->type_name("FILE");
   app.set_version_flag("--version", "quendeld " QUENDEL_VERSION, "Print the version and exit");
   CLI11_PARSE(app, argc, argv);
   openlog("quendeld", LOG_PID | (options.foreground ? LOG_PERROR : 0), LOG_DAEMON);
+  return Run(options);
+}
+
+}  // namespace
+}  // namespace quendeld
+
+int main(int argc, char** argv) {
   try {
-    return quendeld::Run(options);
+    return quendeld::Main(argc, argv);
   } catch (const std::exception& error) {
     syslog(LOG_ERR, "cannot run: %s", error.what());
-    return 1;
+  } catch (...) {
+    syslog(LOG_ERR, "cannot run");
   }
+  return 1;
 }

@@ -6,11 +6,11 @@
 #include <unistd.h>
 
 #include <csignal>
-#include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <ctime>
 #include <functional>
+#include <sstream>
 
 namespace quendeld {
 namespace {
@@ -61,14 +61,15 @@ void ForEachProcess(const std::function<void(pid_t)>& visit) {
 bool BelongsToSession(pid_t process, pid_t session) {
   const std::string status = ReadKernelFile("/proc/" + std::to_string(process) + "/stat");
   const size_t behind = status.rfind(')');
+  if (behind == std::string::npos) {
+    return false;
+  }
+  std::istringstream fields(status.substr(behind + 1));
   char state = 0;
-  int parent = 0;
-  int group = 0;
-  int found = 0;
-  return behind != std::string::npos &&
-         sscanf(status.c_str() + behind + 1, " %c %d %d %d", &state, &parent, &group, &found) ==
-             4 &&
-         found == session && state != 'Z';
+  pid_t parent = 0;
+  pid_t group = 0;
+  pid_t found = 0;
+  return fields >> state >> parent >> group >> found && found == session && state != 'Z';
 }
 
 bool IsMarked(pid_t process) {

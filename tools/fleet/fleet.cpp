@@ -261,9 +261,7 @@ void Run(const Settings& settings) {
   }
 }
 
-}  // namespace
-
-int main(int argc, char** argv) {
+int Main(int argc, char** argv) {
   Settings settings;
   CLI::App app("Plays many devices against a server on this machine", "fleet");
   app.add_option("--port", settings.port, "The server's port")->capture_default_str();
@@ -283,4 +281,18 @@ int main(int argc, char** argv) {
   signal(SIGPIPE, SIG_IGN);
   signal(SIGTERM, [](int) { ending = true; });
   Run(settings);
+  return 0;
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  try {
+    return Main(argc, argv);
+  } catch (const std::exception& error) {
+    fprintf(stderr, "fleet: %s\n", error.what());
+  } catch (...) {
+    fprintf(stderr, "fleet: it broke down\n");
+  }
+  return 1;
 }

@@ -54,7 +54,7 @@ int main(int argc, char** argv) {
   }
   sockaddr_in address = {};
   address.sin_family = AF_INET;
-  address.sin_port = htons(static_cast<uint16_t>(atoi(argv[1])));
+  address.sin_port = htons(static_cast<uint16_t>(strtol(argv[1], nullptr, 10)));
   address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
   const int listener = socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
   const int on = 1;
@@ -64,7 +64,7 @@ int main(int argc, char** argv) {
     perror("tls_echo");
     return 1;
   }
-  for (int i = 1; i < atoi(argv[2]); ++i) {
+  for (int i = 1; i < strtol(argv[2], nullptr, 10); ++i) {
     std::thread(Serve, listener, credentials).detach();
   }
   Serve(listener, credentials);
