@@ -19,6 +19,7 @@
 #include "quendel.h"
 #include "support/appliance.h"
 #include "support/calls.h"
+#include "support/device.h"
 #include "support/log.h"
 #include "support/server.h"
 
@@ -45,7 +46,8 @@ constexpr char kZip[] = "/tmp/quendel/debugdat.zip";
 
 using Plant = std::function<void()>;
 
-mode_t ModeOf(const std::string& path) {
+// Of the entry itself: a link is not followed.
+mode_t ModeOfEntry(const std::string& path) {
   struct stat status = {};
   EXPECT_EQ(lstat(path.c_str(), &status), 0) << path;
   return status.st_mode;
@@ -97,12 +99,6 @@ void PlantHardLink(const std::string& path) {
 
 void PlantFifo(const std::string& path) {
   ASSERT_EQ(mkfifo(path.c_str(), 0666), 0);
-}
-
-void InstallTool(const std::string& path, const std::string& script) {
-  RemoveFile(path);
-  WriteFile(path, "#!/bin/sh\n" + script + "\n");
-  ASSERT_EQ(chmod(path.c_str(), 0755), 0);
 }
 
 // A device with something to collect and to upload, and a neighbour's home beside root's secrets.
@@ -195,7 +191,7 @@ TEST_F(NeighbourTest, GetsNoRunAndNoUploadThroughAWorkRootOfHis) {
     EXPECT_THAT(Log(), Contains(NoUploadDirectory("/tmp/quendel/coredump")));
     EXPECT_EQ(Upload("debug.dat"), 0);
     EXPECT_THAT(Log(), Contains(NoUploadDirectory("/tmp/quendel/debugdat")));
-    EXPECT_TRUE(!S_ISDIR(ModeOf(kWorkRoot)) || fs::is_empty(kWorkRoot));
+    EXPECT_TRUE(!S_ISDIR(ModeOfEntry(kWorkRoot)) || fs::is_empty(kWorkRoot));
     ExpectOutsideUntouched();
   }
 }
@@ -206,10 +202,10 @@ TEST_F(NeighbourTest, LosesTheWorkRootThatRootLeftOpenToHim) {
     ASSERT_EQ(mkdir(kWorkRoot, 0700), 0);
     ASSERT_EQ(chmod(kWorkRoot, mode), 0);
     EXPECT_EQ(CollectOnce(), 0);
-    EXPECT_EQ(ModeOf(kWorkRoot), S_IFDIR | 0700U);
+    EXPECT_EQ(ModeOfEntry(kWorkRoot), S_IFDIR | 0700U);
     ASSERT_EQ(chmod(kWorkRoot, mode), 0);
     EXPECT_EQ(Upload("coredump"), 0);
-    EXPECT_EQ(ModeOf(kWorkRoot), S_IFDIR | 0700U);
+    EXPECT_EQ(ModeOfEntry(kWorkRoot), S_IFDIR | 0700U);
     EXPECT_THAT(Log(), IsEmpty());
   }
 }
@@ -390,7 +386,7 @@ TEST_F(NeighbourTest, GetsNoLinesThroughWhatHePutIntoAnOpenRunDirectory) {
       PlantLink(std::string(kRunDir) + "/" + name, kHome);
     });
     EXPECT_EQ(CollectOnce(0), -1);
-    EXPECT_EQ(ModeOf(kRunDir), S_IFDIR | 0700U);
+    EXPECT_EQ(ModeOfEntry(kRunDir), S_IFDIR | 0700U);
     EXPECT_THAT(Log(), Contains(NoDirectory(name == "udc" ? "UDC" : name,
                                             std::string(kRunDir) + "/" + name)));
     ExpectOutsideUntouched();
@@ -578,7 +574,7 @@ TEST_F(NeighbourTest, GetsNothingHoweverFastHeIs) {
     ASSERT_FALSE(Exists(std::string(kAttic) + "/read")) << ReadFile(std::string(kAttic) + "/read");
     ASSERT_THAT(RootsFilesInTheAttic(), IsEmpty());
     ASSERT_EQ(ReadFile(kRootsOwn), kForged);
-    ASSERT_EQ(ModeOf(kRootsOwn), S_IFREG | 0600U);
+    ASSERT_EQ(ModeOfEntry(kRootsOwn), S_IFREG | 0600U);
   }
   for (const Request& request : Requests()) {
     ASSERT_THAT(request.body, Not(HasSubstr(kSecretText)));
