@@ -108,9 +108,6 @@ RunningDaemon::RunningDaemon(Settings settings) {
       {"conversation_limit", "10"},    {"kill_after", "1"},
       {"free_space_mb", "1"},          {"rotation_quiet", "0.5"},
       {"rotation_wait", "3"}};
-#ifdef __SANITIZE_ADDRESS__
-  all["memory_limit_mb"] = "0";  // the sanitizer's own memory is beyond any limit
-#endif
   for (const auto& [key, value] : settings) {
     all[key] = value;
   }
